@@ -1,0 +1,20 @@
+# Writes the module-definition file of the DLL from the export lists in
+# src/host/exports.hpp, so that names and ordinals are stated once.
+# In: HEADER, OUTPUT, DECORATE (ON for 32-bit stdcall names).
+file(READ "${HEADER}" text)
+string(REGEX MATCHALL "X\\(([A-Za-z]+), ([0-9]+), (SORVEL_ARGS)?([0-9])" entries "${text}")
+set(lines "LIBRARY sorvel.dll\nEXPORTS\n")
+foreach(entry IN LISTS entries)
+  string(REGEX REPLACE "X\\(([A-Za-z]+), ([0-9]+), (SORVEL_ARGS)?([0-9])" "\\1;\\2;\\4" parts "${entry}")
+  list(GET parts 0 name)
+  list(GET parts 1 ordinal)
+  list(GET parts 2 args)
+  if(DECORATE)
+    math(EXPR bytes "${args} * 4")
+    string(APPEND lines "    ${name} = ${name}@${bytes} @${ordinal}\n")
+  else()
+    string(APPEND lines "    ${name} @${ordinal}\n")
+  endif()
+endforeach()
+file(WRITE "${OUTPUT}.tmp" "${lines}")
+execute_process(COMMAND ${CMAKE_COMMAND} -E copy_if_different "${OUTPUT}.tmp" "${OUTPUT}")

@@ -1,0 +1,12 @@
+set(CMAKE_SYSTEM_NAME Linux)
+set(CMAKE_SYSTEM_PROCESSOR i686)
+set(CMAKE_C_COMPILER gcc)
+set(CMAKE_CXX_COMPILER g++)
+set(CMAKE_C_FLAGS_INIT "-m32")
+set(CMAKE_CXX_FLAGS_INIT "-m32")
+set(CMAKE_ASM_FLAGS_INIT "-m32")
+set(CMAKE_EXE_LINKER_FLAGS_INIT "-m32")
+set(CMAKE_SHARED_LINKER_FLAGS_INIT "-m32")
+# This kernel cannot run i386 programs; qemu-user can, with the 32-bit loader.
+set(CMAKE_CROSSCOMPILING_EMULATOR qemu-i386 /lib32/ld-linux.so.2)
+set(CMAKE_LIBRARY_ARCHITECTURE i386-linux-gnu)

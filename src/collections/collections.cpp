@@ -1,0 +1,192 @@
+#include "collections/collections.hpp"
+
+#include <cmath>
+#include <new>
+
+namespace sorvel {
+namespace {
+
+template <class V, class Key, class Order>
+bool contains_key(const Collection<V>& c, const Key& key, const Order& order) noexcept {
+    return TreeSteps<TreeNode<V>>::find(c.root, key, order) != nullptr;
+}
+
+// Leaf insertion. The node is made only once the value is known to be new
+// and the index has room, so a failure leaves everything as it was.
+template <class V, class Key, class Order, class Make>
+bool add_key(Collection<V>& c, const Key& key, const Order& order, Make&& make) noexcept {
+    using Node = TreeNode<V>;
+    Node** link = TreeSteps<Node>::leaf_link(c.root, key, order);
+    if (link == nullptr) {
+        return false;
+    }
+    if (c.index != nullptr && !c.index->reserve_one()) {
+        return false;
+    }
+    Node* node = make();
+    if (node == nullptr) {
+        return false;
+    }
+    node->left = nullptr;
+    node->right = nullptr;
+    node->order = 0;
+    *link = node;
+    if (c.index != nullptr) {
+        c.index->append(node);
+    }
+    ++c.count;
+    return true;
+}
+
+template <class V, class Key, class Order>
+bool remove_key(Collection<V>& c, const Key& key, const Order& order) noexcept {
+    using Node = TreeNode<V>;
+    Node** link = TreeSteps<Node>::link_to(c.root, key, order);
+    if (link == nullptr) {
+        return false;
+    }
+    Node* removed = TreeSteps<Node>::detach(link);
+    if (c.index != nullptr) {
+        c.index->erase(removed);
+    }
+    // A string's characters share the node's block, so one release frees both.
+    memory::release(removed);
+    --c.count;
+    return true;
+}
+
+template <class V>
+void free_nodes(TreeNode<V>* root) noexcept {
+    TreeSteps<TreeNode<V>>::dispose_all(root, [](TreeNode<V>* node) { memory::release(node); });
+}
+
+template <class V>
+void clear_collection(Collection<V>& c) noexcept {
+    c.count = 0;
+    if (c.index != nullptr) {
+        c.index->clear();
+    }
+    TreeNode<V>* root = c.root;
+    c.root = nullptr;
+    free_nodes(root);
+}
+
+template <class V, class Key, class Order>
+std::int32_t position_of_key(const Collection<V>& c, const Key& key, const Order& order) noexcept {
+    if (c.index == nullptr || c.index->empty()) {
+        return -1;
+    }
+    const TreeNode<V>* node = TreeSteps<TreeNode<V>>::find(c.root, key, order);
+    return node == nullptr ? -1 : c.index->position_of(node);
+}
+
+template <class V>
+TreeNode<V>* make_number_node(V value) noexcept {
+    void* block = memory::allocate(sizeof(TreeNode<V>));
+    if (block == nullptr) {
+        return nullptr;
+    }
+    auto* node = new (block) TreeNode<V>();
+    node->value = value;
+    return node;
+}
+
+}  // namespace
+
+int CompareStrings(const char* a, const char* b, bool case_sensitive) noexcept {
+    const auto* x = reinterpret_cast<const unsigned char*>(a);
+    const auto* y = reinterpret_cast<const unsigned char*>(b);
+    if (case_sensitive) {
+        for (;; ++x, ++y) {
+            if (*x != *y) {
+                return *x < *y ? -1 : 1;
+            }
+            if (*x == 0) {
+                return 0;
+            }
+        }
+    }
+    for (;; ++x, ++y) {
+        unsigned p = *x;
+        unsigned q = *y;
+        p += (p - 'A' < 26U) ? 32U : 0U;
+        q += (q - 'A' < 26U) ? 32U : 0U;
+        if (p != q) {
+            return p < q ? -1 : 1;
+        }
+        if (p == 0) {
+            return 0;
+        }
+    }
+}
+
+bool contains(const IntegerCollection& c, std::int32_t value) noexcept {
+    return contains_key(c, value, IntegerOrder{});
+}
+
+bool contains(const FloatCollection& c, float value) noexcept {
+    return !std::isnan(value) && contains_key(c, value, FloatOrder{});
+}
+
+bool contains(const StringCollection& c, const char* value, bool case_sensitive) noexcept {
+    return value != nullptr && contains_key(c, value, StringOrder{case_sensitive});
+}
+
+bool add(IntegerCollection& c, std::int32_t value) noexcept {
+    return add_key(c, value, IntegerOrder{}, [value] { return make_number_node(value); });
+}
+
+bool add(FloatCollection& c, float value) noexcept {
+    return !std::isnan(value) && add_key(c, value, FloatOrder{}, [value] { return make_number_node(value); });
+}
+
+bool AddStringValue(StringCollection& c, const char* value, bool case_sensitive) noexcept {
+    if (value == nullptr) {
+        return false;
+    }
+    return add_key(c, value, StringOrder{case_sensitive}, [value]() -> StringNode* {
+        const std::size_t length = std::strlen(value);
+        // The characters follow the node in the same block; the node owns them.
+        void* block = memory::allocate(sizeof(StringNode) + length + 1);
+        if (block == nullptr) {
+            return nullptr;
+        }
+        auto* node = new (block) StringNode();
+        char* copy = reinterpret_cast<char*>(node + 1);
+        std::memcpy(copy, value, length + 1);
+        node->value = copy;
+        return node;
+    });
+}
+
+bool remove(IntegerCollection& c, std::int32_t value) noexcept { return remove_key(c, value, IntegerOrder{}); }
+
+bool remove(FloatCollection& c, float value) noexcept {
+    return !std::isnan(value) && remove_key(c, value, FloatOrder{});
+}
+
+bool remove(StringCollection& c, const char* value, bool case_sensitive) noexcept {
+    return value != nullptr && remove_key(c, value, StringOrder{case_sensitive});
+}
+
+void clear(IntegerCollection& c) noexcept { clear_collection(c); }
+void clear(FloatCollection& c) noexcept { clear_collection(c); }
+void clear(StringCollection& c) noexcept { clear_collection(c); }
+
+void free_tree(IntegerNode* root) noexcept { free_nodes(root); }
+void free_tree(FloatNode* root) noexcept { free_nodes(root); }
+void FreeStringTree(StringNode* root) noexcept { free_nodes(root); }
+
+std::int32_t position_of(const IntegerCollection& c, std::int32_t value) noexcept {
+    return position_of_key(c, value, IntegerOrder{});
+}
+
+std::int32_t position_of(const FloatCollection& c, float value) noexcept {
+    return std::isnan(value) ? -1 : position_of_key(c, value, FloatOrder{});
+}
+
+std::int32_t position_of(const StringCollection& c, const char* value, bool case_sensitive) noexcept {
+    return value == nullptr ? -1 : position_of_key(c, value, StringOrder{case_sensitive});
+}
+
+}  // namespace sorvel

@@ -1,0 +1,251 @@
+// The test host: plays the host runtime for the library, the way a real host
+// calls it. It loads the built library, calls DllMain as a loader would,
+// reads the handler tables from GetRunObjectInfos, hands out zero-filled run
+// records, serves the host routines and records every call made to them.
+//
+// Records are addressed at their literal byte offsets (see RecordLayout), not
+// through the library's own headers, so a layout mistake cannot hide on both
+// sides.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <deque>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+namespace sorvel::testhost {
+
+using word = std::intptr_t;
+
+// Byte offsets of the host records on this target.
+struct RecordLayout {
+    static constexpr std::size_t kWord = sizeof(void*);
+    static constexpr bool kWide = kWord == 8;
+    static constexpr std::size_t kRunRecordSize = kWide ? 448 : 408;
+    static constexpr std::size_t kHeaderPointer = 8;
+    static constexpr std::size_t kCreationWordA = 76;
+    static constexpr std::size_t kCreationWordB = 84;
+    static constexpr std::size_t kResultFlags = 124;
+    static constexpr std::size_t kReader = 360;
+    static constexpr std::size_t kCaseSensitive = kWide ? 368 : 364;
+    static constexpr std::size_t kUseIndices = kWide ? 372 : 368;
+    static constexpr std::size_t kIntegerRoot = kWide ? 376 : 372;
+    static constexpr std::size_t kIntegerCount = kWide ? 384 : 376;
+    static constexpr std::size_t kFloatRoot = kWide ? 392 : 380;
+    static constexpr std::size_t kFloatCount = kWide ? 400 : 384;
+    static constexpr std::size_t kStringRoot = kWide ? 408 : 388;
+    static constexpr std::size_t kStringCount = kWide ? 416 : 392;
+    static constexpr std::size_t kIntegerIndex = kWide ? 424 : 396;
+    static constexpr std::size_t kFloatIndex = kWide ? 432 : 400;
+    static constexpr std::size_t kStringIndex = kWide ? 440 : 404;
+    // ObjectInfoBlock
+    static constexpr std::size_t kInfoConditions = 0;
+    static constexpr std::size_t kInfoActions = kWord;
+    static constexpr std::size_t kInfoExpressions = 2 * kWord;
+    static constexpr std::size_t kInfoCounts = 3 * kWord;  // four 16-bit words
+    static constexpr std::size_t kInfoFlags = kInfoCounts + 8;
+    static constexpr std::size_t kInfoLetter = kInfoFlags + 4;
+    static constexpr std::size_t kInfoUntouched = kInfoLetter + 1;
+    static constexpr std::size_t kInfoZero = kInfoLetter + 2;
+    static constexpr std::size_t kInfoIdentifier = kInfoLetter + 4;
+    static constexpr std::size_t kInfoVersion = kInfoIdentifier + 4;
+    static constexpr std::size_t kInfoSize = kInfoVersion + 2;
+    // TreeNode: value, left, right, each a word apart.
+    static constexpr std::size_t kNodeLeft = kWord;
+    static constexpr std::size_t kNodeRight = 2 * kWord;
+    // HostRunHeader words and HostServiceTable entries.
+    static constexpr std::size_t kAllocResultString = 218;
+    static constexpr std::size_t kReadFirstExprParam = 219;
+    static constexpr std::size_t kReadNextExprParam = 220;
+    static constexpr std::size_t kReadEventParam = 232;
+    static constexpr std::size_t kServiceTable = 317;
+    static constexpr std::size_t kOpenFile = 80;
+    static constexpr std::size_t kCloseFile = 81;
+};
+
+// The loaded library and its exports.
+class Library {
+public:
+    // Loads by path (dlopen, or LoadLibrary on Windows). Throws
+    // std::runtime_error when the library or an export cannot be found.
+    static std::shared_ptr<Library> load(const std::string& path);
+    // The library linked into this program (tests that need its allocator).
+    static std::shared_ptr<Library> linked_in();
+    // The default built library next to the test programs.
+    static std::shared_ptr<Library> built();
+
+    ~Library();
+    Library(const Library&) = delete;
+    Library& operator=(const Library&) = delete;
+
+    void* symbol(const char* name) const;  // null when absent
+    void* symbol_by_ordinal(int ordinal) const;  // Windows only; null elsewhere
+    word module_handle() const;
+
+    // Calls a function of the library with the given words. On i386 the call
+    // checks that the callee removed exactly its arguments (stdcall); every
+    // mismatch is counted in stack_errors().
+    word call(void* function, std::initializer_list<word> args) const;
+    word call_export(const char* name, std::initializer_list<word> args) const;
+    static std::size_t stack_errors();
+
+private:
+    Library() = default;
+    void* handle_ = nullptr;
+    bool owned_ = false;
+};
+
+// A parameter value the host gives for the next parameter request.
+struct Param {
+    enum class Kind { integer, floating, string, null_string, raw };
+    Kind kind = Kind::integer;
+    std::int32_t integer = 0;
+    float floating = 0;
+    std::string text;
+    word raw = 0;
+
+    static Param of(std::int32_t v);
+    static Param of(float v);
+    static Param of(std::string v);
+    static Param of(const char* v);
+    static Param null();
+    static Param raw_word(word w);
+};
+
+// One call of a host routine by the library.
+struct HostCall {
+    enum class Routine { read_event_param, read_first_expr_param, read_next_expr_param, alloc_result_string,
+                         open_file, close_file };
+    Routine routine;
+    std::vector<word> args;
+};
+
+class Host;
+
+// One object instance: a zero-filled run record handed to CreateRunObject.
+class Instance {
+public:
+    unsigned char* record() { return record_.data(); }
+    word address() { return reinterpret_cast<word>(record_.data()); }
+
+    // Fields at their literal offsets.
+    std::int32_t i32(std::size_t offset) const;
+    std::uint16_t u16(std::size_t offset) const;
+    word pointer(std::size_t offset) const;
+    std::uint16_t result_flags() const { return u16(RecordLayout::kResultFlags); }
+    void set_result_flags(std::uint16_t flags);
+
+    // Collections: 0 integers, 1 floats, 2 strings.
+    std::int32_t count(int collection) const;
+    word root(int collection) const;
+    word index(int collection) const;
+
+private:
+    friend class Host;
+    std::vector<unsigned char> record_;
+    bool destroyed_ = false;
+};
+
+// Reads a tree read-only at its documented layout.
+struct NodeView {
+    word address = 0;
+    std::int32_t integer() const;
+    float floating() const;
+    std::string string() const;
+    NodeView left() const;
+    NodeView right() const;
+    explicit operator bool() const { return address != 0; }
+};
+
+class Host {
+public:
+    explicit Host(std::shared_ptr<Library> library);
+    ~Host();
+    Host(const Host&) = delete;
+    Host& operator=(const Host&) = delete;
+
+    Library& library() { return *library_; }
+
+    // Loader and information calls.
+    word dll_main(word reason);
+    struct Tables {
+        word conditions = 0, actions = 0, expressions = 0;
+        std::uint16_t condition_count = 0, action_count = 0, expression_count = 0, edit_size = 0;
+    };
+    Tables tables() const { return tables_; }
+    word table_entry(int kind, std::size_t n) const;  // kind 0 conditions, 1 actions, 2 expressions
+
+    // Instances. The options are the EditRecord words at 20 and 24.
+    Instance& create(std::int32_t case_sensitive, std::int32_t use_indices, std::int32_t creation8 = 0,
+                     std::int32_t creation12 = 0);
+    void destroy(Instance& instance);
+
+    // Handlers, by kind and number. The parameters are queued and handed out
+    // by the host routines in order; every queued value must be consumed.
+    word condition(Instance& instance, std::size_t number, std::vector<Param> params = {});
+    word action(Instance& instance, std::size_t number, std::vector<Param> params = {});
+    word expression(Instance& instance, std::size_t number, std::vector<Param> params = {}, word param_word = 0);
+
+    // Handlers by display string ("Add Integer: %0", "IntegersSize(", ...).
+    word event(Instance& instance, std::string_view display, std::vector<Param> params = {}, word param_word = 0);
+
+    // Results.
+    static std::string text_at(word result);
+    static float float_bits(word result);
+
+    // Recorded host routine calls since the last clear.
+    const std::vector<HostCall>& calls() const { return calls_; }
+    void clear_calls() { calls_.clear(); }
+    std::size_t calls_to(HostCall::Routine routine) const;
+    std::size_t unconsumed_params() const { return params_.size(); }
+
+    // Result-string space: owned by the host; a test can make it give none.
+    void give_no_result_buffer(bool none) { no_buffer_ = none; }
+
+    // Files: HostOpenFile opens real files on disk.
+    std::size_t opens() const { return opens_; }
+    std::size_t closes() const { return closes_; }
+    std::size_t open_handles() const { return opens_ - closes_; }
+
+    // Host routine entry points call back into the active host.
+    static Host* active();
+
+private:
+    friend struct Routines;
+    word next_param();
+    word call_handler(word handler, Instance& instance, std::initializer_list<word> args);
+
+    std::shared_ptr<Library> library_;
+    Tables tables_;
+    std::vector<word> header_;   // HostRunHeader: a table of words
+    std::vector<word> services_; // HostServiceTable
+    std::vector<std::unique_ptr<Instance>> instances_;
+    std::deque<Param> params_;
+    std::vector<HostCall> calls_;
+    std::deque<std::string> held_strings_;  // parameter strings while a handler runs
+    std::deque<std::unique_ptr<char[]>> result_buffers_;
+    bool no_buffer_ = false;
+    std::size_t opens_ = 0;
+    std::size_t closes_ = 0;
+};
+
+// The runtime generator the library draws from. On ELF targets this program
+// defines rand itself, so every draw is scripted and counted; on Windows the
+// shared C runtime generator is seeded and its sequence learnt in advance.
+namespace draws {
+// Reseeds and gives the next n values (low 15 bits) the library will draw.
+std::vector<int> reseed(unsigned seed, std::size_t n);
+// ELF only: the exact values the next draws give (then the seeded sequence).
+bool scriptable();
+void script(std::vector<int> values);
+// Draws made since the last reseed or script. On Windows it is found by
+// matching the generator's next values against the learnt sequence; the
+// generator's state moves on, so call reseed before drawing again.
+std::size_t made();
+}  // namespace draws
+
+}  // namespace sorvel::testhost
