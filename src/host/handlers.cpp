@@ -31,9 +31,11 @@ void load_from_file(RunRecord* r, const char* name, std::int32_t balance) noexce
         return;
     }
     // One spare byte lets the last line be terminated in place.
+    // Only a 32-bit size_t can lack room for it.
     char* buffer = nullptr;
-    if (static_cast<std::size_t>(size) < static_cast<std::size_t>(-1)) {
-        buffer = static_cast<char*>(memory::allocate(static_cast<std::size_t>(size) + 1));
+    const std::size_t bytes = size;
+    if (bytes != SIZE_MAX) {
+        buffer = static_cast<char*>(memory::allocate(bytes + 1));
     }
     if (buffer != nullptr) {
         const std::uint32_t read = read_once(handle, buffer, size);

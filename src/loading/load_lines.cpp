@@ -42,28 +42,72 @@ void load_in_file_order(StringCollection& strings, bool case_sensitive, char* da
     }
 }
 
-// Draws k = r mod n and adds the k-th remaining line counted from the front,
-// n being the number of lines left, until none is left. The remaining lines
-// are kept as a binary indexed tree of presence counts over the line
-// positions, so finding the k-th one and taking it out are O(log n) each and
-// the order is exactly that of removing from a list whose gap closes.
+// The lines not yet added, as a binary indexed tree of presence counts over
+// the line positions, numbered from 1. Entry i counts the remaining lines
+// among positions (i - lowest_bit(i), i]. Finding the k-th remaining line and
+// taking it out cost O(log n) each, and the lines left keep their file order
+// exactly as in a list whose gap closes.
+class RemainingLines {
+public:
+    // `tree` has room for entries 0 .. 2 * bit_floor(lines) - 1.
+    RemainingLines(std::size_t* tree, std::size_t lines) noexcept
+        : tree_(tree), lines_(lines), top_(std::bit_floor(lines)) {
+        for (std::size_t i = 1; i <= lines_; ++i) {
+            tree_[i] = lowest_bit(i);
+        }
+        // The padding counts more lines than can ever be skipped, so the
+        // search never steps onto it and needs no bounds test.
+        for (std::size_t i = lines_ + 1; i < 2 * top_; ++i) {
+            tree_[i] = lines_;
+        }
+    }
+
+    static std::size_t entries_for(std::size_t lines) noexcept { return 2 * std::bit_floor(lines); }
+
+    // Takes out the remaining line that has `skip` remaining lines before it
+    // and gives its position, counted from 0.
+    std::size_t take(std::size_t skip) noexcept {
+        // The largest position whose prefix holds no more than `skip` lines;
+        // the wanted line is the one after it.
+        std::size_t position = 0;
+        for (std::size_t step = top_; step != 0; step >>= 1) {
+            const std::size_t next = position + step;
+            if (tree_[next] <= skip) {
+                position = next;
+                skip -= tree_[next];
+            }
+        }
+        for (std::size_t i = position + 1; i <= lines_; i += lowest_bit(i)) {
+            --tree_[i];
+        }
+        return position;
+    }
+
+private:
+    std::size_t* tree_;
+    std::size_t lines_;
+    std::size_t top_;
+};
+
+// While lines remain: draw r, take the (r mod n)-th remaining line counted
+// from the front, n being the number left, and add it.
 void load_in_balanced_order(StringCollection& strings, bool case_sensitive, char* data, std::size_t length,
                             DrawSource draw) noexcept {
     const std::size_t lines = count_lines(data, length);
     if (lines == 0) {
         return;
     }
-    // One block: the line starts, then the tree at positions 1..lines.
-    constexpr std::size_t kMaxLines = (SIZE_MAX / sizeof(std::size_t) - 1) / 2;
+    // One block for the bookkeeping: the line starts, then the tree.
+    constexpr std::size_t kMaxLines = SIZE_MAX / sizeof(std::size_t) / 4;
     if (lines > kMaxLines) {
         return;
     }
-    auto* block = static_cast<std::size_t*>(memory::allocate(sizeof(std::size_t) * (2 * lines + 1)));
+    const std::size_t entries = lines + RemainingLines::entries_for(lines);
+    auto* block = static_cast<std::size_t*>(memory::allocate(sizeof(std::size_t) * entries));
     if (block == nullptr) {
         return;
     }
     std::size_t* starts = block;
-    std::size_t* tree = block + lines;
 
     std::size_t line = 0;
     bool in_line = false;
@@ -78,31 +122,25 @@ void load_in_balanced_order(StringCollection& strings, bool case_sensitive, char
     }
     data[length] = '\0';
 
-    // With every line present, entry i counts the lines (i - lowest_bit(i), i].
-    for (std::size_t i = 1; i <= lines; ++i) {
-        tree[i] = lowest_bit(i);
-    }
-    const std::size_t top = std::bit_floor(lines);
+    RemainingLines remaining_lines(block + lines, lines);
+    auto pick = [&](std::size_t remaining) noexcept {
+        return remaining_lines.take(static_cast<std::size_t>(draw() & kDrawMask) % remaining);
+    };
+    std::size_t next = pick(lines);
     for (std::size_t remaining = lines; remaining != 0; --remaining) {
-        std::size_t skip = static_cast<std::size_t>(draw() & kDrawMask) % remaining;
-        // The largest position whose prefix holds no more than `skip` lines;
-        // the wanted line is the next one.
-        std::size_t position = 0;
-        for (std::size_t step = top; step != 0; step >>= 1) {
-            const std::size_t next = position + step;
-            if (next <= lines && tree[next] <= skip) {
-                position = next;
-                skip -= tree[next];
-            }
-        }
-        for (std::size_t i = position + 1; i <= lines; i += lowest_bit(i)) {
-            --tree[i];
+        const char* chosen = data + starts[next];
+        // The next line is picked before this one is added, so that its bytes
+        // are on their way in while the collection is searched. Adding draws
+        // nothing, so the lines are added in the order of their draws.
+        if (remaining > 1) {
+            next = pick(remaining - 1);
+            __builtin_prefetch(data + starts[next]);
         }
         // A line that does not fit when memory runs out is left out and the
         // load goes on: every add is all or nothing, so the collection stays
         // consistent, a shorter later line may still fit, and the draws stay
         // one per line whatever happens to each.
-        AddStringValue(strings, data + starts[position], case_sensitive);
+        AddStringValue(strings, chosen, case_sensitive);
     }
     memory::release(block);
 }

@@ -11,8 +11,10 @@
 #include <cstddef>
 #include <cstdint>
 #include <deque>
+#include <initializer_list>
 #include <memory>
 #include <optional>
+#include <set>
 #include <string>
 #include <string_view>
 #include <vector>
@@ -86,17 +88,31 @@ public:
     void* symbol_by_ordinal(int ordinal) const;  // Windows only; null elsewhere
     word module_handle() const;
 
+    // What the loader calls: DllMain itself where the test host plays the
+    // loader (ELF, linked in), the module's entry point on Windows, where the
+    // real loader has already made the process attach call.
+    void* entry_point() const;
+    bool loader_owned() const { return loader_owned_; }
+
     // Calls a function of the library with the given words. On i386 the call
     // checks that the callee removed exactly its arguments (stdcall); every
     // mismatch is counted in stack_errors().
     word call(void* function, std::initializer_list<word> args) const;
     word call_export(const char* name, std::initializer_list<word> args) const;
     static std::size_t stack_errors();
+    // For the test that proves the check itself catches a wrong callee.
+    static void reset_stack_errors();
 
 private:
+    struct Symbol {
+        const char* name;
+        void* address;
+    };
     Library() = default;
     void* handle_ = nullptr;
     bool owned_ = false;
+    bool loader_owned_ = false;
+    std::vector<Symbol> symbols_;  // linked in: the program's own table
 };
 
 // A parameter value the host gives for the next parameter request.
@@ -122,6 +138,7 @@ struct HostCall {
                          open_file, close_file };
     Routine routine;
     std::vector<word> args;
+    word result = 0;  // what the host gave back
 };
 
 class Host;
@@ -144,10 +161,18 @@ public:
     word root(int collection) const;
     word index(int collection) const;
 
+    // What CreateRunObject and DestroyRunObject gave.
+    word create_result() const { return create_result_; }
+    word destroy_result() const { return destroy_result_; }
+    bool destroyed() const { return destroyed_; }
+    std::size_t size() const { return record_.size(); }
+
 private:
     friend class Host;
     std::vector<unsigned char> record_;
     bool destroyed_ = false;
+    word create_result_ = -1;
+    word destroy_result_ = -1;
 };
 
 // Reads a tree read-only at its documented layout.
@@ -170,8 +195,16 @@ public:
 
     Library& library() { return *library_; }
 
-    // Loader and information calls.
+    // Loader and information calls. dll_main calls the library's entry point
+    // with this reason and then reads the tables again. On Windows the real
+    // loader owns process attach and detach (0 and 1): asking for them there
+    // throws std::logic_error.
     word dll_main(word reason);
+    // Calls GetRunObjectInfos with a fresh block of `fill` bytes and takes the
+    // tables from it; gives its result.
+    word read_infos(unsigned char fill = 0xAB);
+    const std::vector<unsigned char>& info_block() const { return info_block_; }
+    word run_record_size() const { return record_size_; }
     struct Tables {
         word conditions = 0, actions = 0, expressions = 0;
         std::uint16_t condition_count = 0, action_count = 0, expression_count = 0, edit_size = 0;
@@ -182,7 +215,8 @@ public:
     // Instances. The options are the EditRecord words at 20 and 24.
     Instance& create(std::int32_t case_sensitive, std::int32_t use_indices, std::int32_t creation8 = 0,
                      std::int32_t creation12 = 0);
-    void destroy(Instance& instance);
+    // DestroyRunObject with the record and `second`, a word it does not read.
+    void destroy(Instance& instance, word second = 0);
 
     // Handlers, by kind and number. The parameters are queued and handed out
     // by the host routines in order; every queued value must be consumed.
@@ -201,7 +235,10 @@ public:
     const std::vector<HostCall>& calls() const { return calls_; }
     void clear_calls() { calls_.clear(); }
     std::size_t calls_to(HostCall::Routine routine) const;
+    // Left from the last handler call; each handler call starts a new queue.
     std::size_t unconsumed_params() const { return params_.size(); }
+    // Parameter requests the queue could not serve (they got 0).
+    std::size_t missing_params() const { return missing_params_; }
 
     // Result-string space: owned by the host; a test can make it give none.
     void give_no_result_buffer(bool none) { no_buffer_ = none; }
@@ -210,6 +247,11 @@ public:
     std::size_t opens() const { return opens_; }
     std::size_t closes() const { return closes_; }
     std::size_t open_handles() const { return opens_ - closes_; }
+    // HostCloseFile calls with a handle that is not open.
+    std::size_t bad_closes() const { return bad_closes_; }
+    // HostOpenFile reports this many bytes more than the file holds, as a
+    // host whose size is stale would (0: the true size).
+    void overstate_file_size(std::uint32_t extra) { overstated_by_ = extra; }
 
     // Host routine entry points call back into the active host.
     static Host* active();
@@ -226,11 +268,20 @@ private:
     std::vector<std::unique_ptr<Instance>> instances_;
     std::deque<Param> params_;
     std::vector<HostCall> calls_;
-    std::deque<std::string> held_strings_;  // parameter strings while a handler runs
+    // Parameter strings: exact-size copies, freed when the handler returns,
+    // so a library that keeps a pointer instead of a copy reads freed memory.
+    std::deque<std::unique_ptr<char[]>> held_strings_;
     std::deque<std::unique_ptr<char[]>> result_buffers_;
+    std::vector<unsigned char> info_block_;
+    word record_size_ = 0;
     bool no_buffer_ = false;
+    std::size_t missing_params_ = 0;
     std::size_t opens_ = 0;
     std::size_t closes_ = 0;
+    std::size_t bad_closes_ = 0;
+    std::uint32_t overstated_by_ = 0;
+    std::set<word> open_files_;
+    Host* previous_active_ = nullptr;
 };
 
 // The runtime generator the library draws from. On ELF targets this program
@@ -243,8 +294,8 @@ std::vector<int> reseed(unsigned seed, std::size_t n);
 bool scriptable();
 void script(std::vector<int> values);
 // Draws made since the last reseed or script. On Windows it is found by
-// matching the generator's next values against the learnt sequence; the
-// generator's state moves on, so call reseed before drawing again.
+// matching the generator's next values against the learnt sequence, after
+// which the generator is put back where it was.
 std::size_t made();
 }  // namespace draws
 

@@ -1,0 +1,1026 @@
+// Differential fuzzer: decodes its input into events for one to three object
+// instances, runs them through the library's real handler tables by way of
+// the test host, and after every event holds the library against the
+// reference model in model.hpp: results, counts, result flags, host calls,
+// draws, tree shapes and (on request and at the end) insertion order.
+// Any difference aborts with a description of the event and its history, and
+// libFuzzer keeps the input that caused it.
+#include <unistd.h>
+
+#include <array>
+#include <bit>
+#include <cstddef>
+#include <cstdint>
+#include <cstdio>
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <limits>
+#include <memory>
+#include <optional>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "model.hpp"
+#include "test_host.hpp"
+
+namespace {
+
+namespace draws = sorvel::testhost::draws;
+using sorvel::testhost::Host;
+using sorvel::testhost::HostCall;
+using sorvel::testhost::Instance;
+using sorvel::testhost::Library;
+using sorvel::testhost::NodeView;
+using sorvel::testhost::Param;
+using sorvel::testhost::RecordLayout;
+using sorvel::testhost::word;
+using Routine = HostCall::Routine;
+using Text = fuzzmodel::Instance::Text;
+
+// Bounds that keep one execution in the millisecond range.
+constexpr std::size_t kMaxEvents = 256;
+constexpr std::size_t kMaxFileBytes = 160;
+constexpr std::size_t kPoolSize = 48;
+constexpr std::size_t kHistory = 40;
+
+constexpr std::uint16_t kFloatFlag = 0x4000;
+constexpr std::uint16_t kStringFlag = 0x8000;
+
+constexpr int kIntegers = 0;
+constexpr int kFloats = 1;
+constexpr int kStrings = 2;
+
+// Option words: every on/off combination, and values other than 0 and 1.
+constexpr std::array<std::int32_t, 4> kOptionWords = {-1, 0, 1, 2};
+
+// ------------------------------------------------------------ reporting
+
+std::vector<std::string> g_history;
+std::string g_current;
+// SORVEL_FUZZ_TRACE=1 prints every event as it runs, to read an input back.
+const bool g_trace = std::getenv("SORVEL_FUZZ_TRACE") != nullptr;
+
+std::string hex32(std::uint32_t v) {
+    char text[16];
+    std::snprintf(text, sizeof text, "0x%08X", v);
+    return text;
+}
+
+std::string show(const Text& text) {
+    if (!text) {
+        return "(null)";
+    }
+    std::string out = "\"";
+    for (const char c : *text) {
+        const auto byte = static_cast<unsigned char>(c);
+        if (byte >= 0x20 && byte < 0x7F && byte != '"' && byte != '\\') {
+            out += c;
+        } else {
+            char esc[8];
+            std::snprintf(esc, sizeof esc, "\\x%02X", byte);
+            out += esc;
+        }
+    }
+    return out + "\"";
+}
+
+std::string show_float(std::uint32_t bits) {
+    char text[48];
+    std::snprintf(text, sizeof text, "%g[%s]", static_cast<double>(std::bit_cast<float>(bits)), hex32(bits).c_str());
+    return text;
+}
+
+[[noreturn]] void mismatch(const std::string& what) {
+    std::fprintf(stderr, "\n=== sorvel differential fuzzer: MISMATCH\n");
+    std::fprintf(stderr, "event: %s\n", g_current.c_str());
+    std::fprintf(stderr, "what:  %s\n", what.c_str());
+    std::fprintf(stderr, "recent events (oldest first):\n");
+    const std::size_t from = g_history.size() > kHistory ? g_history.size() - kHistory : 0;
+    for (std::size_t i = from; i < g_history.size(); ++i) {
+        std::fprintf(stderr, "  %s\n", g_history[i].c_str());
+    }
+    std::fflush(stderr);
+    std::abort();
+}
+
+template <class T>
+void expect_equal(const T& got, const T& want, const std::string& what) {
+    if (!(got == want)) {
+        mismatch(what + ": library " + std::to_string(got) + ", model " + std::to_string(want));
+    }
+}
+
+void expect_text(const std::string& got, const std::string& want, const std::string& what) {
+    if (got != want) {
+        mismatch(what + ": library " + show(got) + ", model " + show(want));
+    }
+}
+
+// ------------------------------------------------------------ input
+
+// Reads the fuzzer's bytes from the front; past the end it gives zeros.
+class Input {
+public:
+    Input(const std::uint8_t* data, std::size_t size) : data_(data), size_(size) {}
+    bool exhausted() const { return at_ >= size_; }
+    std::uint8_t byte() { return at_ < size_ ? data_[at_++] : 0; }
+    std::uint16_t u16() { return static_cast<std::uint16_t>(byte() | (byte() << 8)); }
+    std::uint32_t u32() {
+        const std::uint32_t low = u16();
+        return low | (static_cast<std::uint32_t>(u16()) << 16);
+    }
+
+private:
+    const std::uint8_t* data_;
+    std::size_t size_;
+    std::size_t at_ = 0;
+};
+
+// Values met so far, so that later events hit them again (duplicates,
+// removals of held values, case variants).
+template <class T>
+class Pool {
+public:
+    void put(const T& v) {
+        if (values_.size() < kPoolSize) {
+            values_.push_back(v);
+        } else {
+            values_[next_++ % kPoolSize] = v;
+        }
+    }
+    bool empty() const { return values_.empty(); }
+    const T& pick(std::uint8_t b) const { return values_[b % values_.size()]; }
+
+private:
+    std::vector<T> values_;
+    std::size_t next_ = 0;
+};
+
+class Values {
+public:
+    explicit Values(Input& in) : in_(in) {}
+
+    std::int32_t integer() {
+        static constexpr std::array<std::int32_t, 12> kSpecial = {
+            std::numeric_limits<std::int32_t>::min(), std::numeric_limits<std::int32_t>::max(), 0, -1, 1,
+            std::numeric_limits<std::int32_t>::min() + 1, std::numeric_limits<std::int32_t>::max() - 1,
+            65535, 65536, -65536, 32767, 32768};
+        std::int32_t v = 0;
+        const std::uint8_t b = in_.byte();
+        switch (b % 8) {
+            case 0:
+            case 1: v = static_cast<std::int8_t>(in_.byte()); break;
+            case 2: v = kSpecial[in_.byte() % kSpecial.size()]; break;
+            case 3: v = static_cast<std::int32_t>(in_.u32()); break;
+            case 7: v = in_.byte() % 8; break;
+            default: v = ints_.empty() ? static_cast<std::int8_t>(in_.byte()) : ints_.pick(in_.byte()); break;
+        }
+        ints_.put(v);
+        return v;
+    }
+
+    // The 32 bits of a float, NaNs with any payload included.
+    std::uint32_t float_bits() {
+        static constexpr std::array<std::uint32_t, 20> kSpecial = {
+            0x00000000, 0x80000000,              // +0.0, -0.0
+            0x7F800000, 0xFF800000,              // +inf, -inf
+            0x7FC00000, 0xFFC00000, 0x7F800001,  // quiet NaNs, a signalling NaN
+            0x7FBFFFFF, 0xFFFFFFFF, 0x7FFFFFFF,  // more NaN payloads
+            0x00000001, 0x80000001,              // smallest denormals
+            0x007FFFFF, 0x807FFFFF,              // largest denormals
+            0x00800000, 0x7F7FFFFF, 0xFF7FFFFF,  // FLT_MIN, FLT_MAX, -FLT_MAX
+            0x3F800000, 0x3F800001, 0x3F7FFFFF,  // 1.0 and its neighbours
+        };
+        std::uint32_t bits = 0;
+        const std::uint8_t b = in_.byte();
+        switch (b % 10) {
+            case 0: bits = std::bit_cast<std::uint32_t>(static_cast<float>(static_cast<std::int8_t>(in_.byte()))); break;
+            case 1: bits = kSpecial[in_.byte() % kSpecial.size()]; break;
+            case 2: {  // NaN: all-ones exponent, non-zero payload, either sign
+                const std::uint32_t raw = in_.u32();
+                bits = (raw & 0x80000000U) | 0x7F800000U | (raw & 0x007FFFFFU) | ((raw & 0x007FFFFFU) == 0 ? 1U : 0U);
+                break;
+            }
+            case 3: {  // denormal (or a zero), either sign
+                const std::uint32_t raw = in_.u32();
+                bits = (raw & 0x80000000U) | (raw & 0x007FFFFFU);
+                break;
+            }
+            case 4: bits = in_.u32(); break;
+            case 8:  // a neighbouring bit pattern of a value met before
+                bits = floats_.empty() ? 0U : floats_.pick(in_.byte()) + ((b & 0x10) != 0 ? 1U : 0xFFFFFFFFU);
+                break;
+            case 9:
+                bits = std::bit_cast<std::uint32_t>(static_cast<float>(static_cast<std::int8_t>(in_.byte())) / 4.0F);
+                break;
+            default: bits = floats_.empty() ? 0U : floats_.pick(in_.byte()); break;
+        }
+        floats_.put(bits);
+        return bits;
+    }
+
+    // A string parameter: nullopt stands for a null pointer from the host.
+    Text text(bool allow_null = true) {
+        static constexpr char kAlphabet[] = "aAbBmMzZ_[`^\\]{|}~@09 \x7F\x80\xE9\xFF";
+        constexpr std::size_t kLetters = sizeof kAlphabet - 1;
+        std::string s;
+        const std::uint8_t b = in_.byte();
+        switch (b % 10) {
+            case 0: break;  // the empty string
+            case 1:
+            case 2: {
+                const std::size_t length = in_.byte() % 6;
+                for (std::size_t i = 0; i < length; ++i) {
+                    s += kAlphabet[in_.byte() % kLetters];
+                }
+                break;
+            }
+            case 5: {  // the same letters in other cases
+                s = strings_.empty() ? std::string("Ab") : strings_.pick(in_.byte());
+                std::uint8_t flips = in_.byte();
+                for (char& c : s) {
+                    if ((flips & 1) != 0) {
+                        if (c >= 'a' && c <= 'z') {
+                            c = static_cast<char>(c - 'a' + 'A');
+                        } else if (c >= 'A' && c <= 'Z') {
+                            c = static_cast<char>(c - 'A' + 'a');
+                        }
+                    }
+                    flips = static_cast<std::uint8_t>((flips >> 1) | (flips << 7));
+                }
+                break;
+            }
+            case 6: {  // any bytes, zero, CR and LF included
+                const std::size_t length = in_.byte() % 12;
+                for (std::size_t i = 0; i < length; ++i) {
+                    s += static_cast<char>(in_.byte());
+                }
+                break;
+            }
+            case 7: {  // a prefix of a held string, or one with a byte more
+                s = strings_.empty() ? std::string("m") : strings_.pick(in_.byte());
+                const std::uint8_t how = in_.byte();
+                if ((how & 1) != 0 && !s.empty()) {
+                    s.resize(how % s.size());
+                } else {
+                    s += kAlphabet[(how >> 1) % kLetters];
+                }
+                break;
+            }
+            case 8:
+                if (allow_null) {
+                    return std::nullopt;
+                }
+                break;
+            case 9:  // a zero byte cuts the string the library sees
+                s = strings_.empty() ? std::string("z") : strings_.pick(in_.byte());
+                s += '\0';
+                s += kAlphabet[in_.byte() % kLetters];
+                break;
+            default: s = strings_.empty() ? std::string("a") : strings_.pick(in_.byte()); break;
+        }
+        strings_.put(s.substr(0, s.find('\0')));
+        return s;
+    }
+
+    // A position for the value-at-position expressions.
+    std::int32_t position(std::int32_t count) {
+        static constexpr std::array<std::int32_t, 8> kSpecial = {
+            std::numeric_limits<std::int32_t>::min(), std::numeric_limits<std::int32_t>::max(), -1, -65536, 65536,
+            65537, -2, 0x10000 - 1};
+        const std::uint8_t b = in_.byte();
+        switch (b % 4) {
+            case 0:
+            case 1: return static_cast<std::int32_t>(in_.byte() % (static_cast<unsigned>(count) + 3U)) - 1;
+            case 2: return kSpecial[in_.byte() % kSpecial.size()];
+            default: return integer();
+        }
+    }
+
+    // The second argument of an expression handler: any 32-bit value.
+    std::int32_t param_word() {
+        static constexpr std::array<std::uint32_t, 10> kSpecial = {
+            0x00010001, 0x0000FFFF, 0x00008000, 0x00007FFF, 0xFFFF8000,
+            0x80000000, 0x12345678, 0xFFFFFFFF, 0x00010000, 0x7FFFFFFF};
+        const std::uint8_t b = in_.byte();
+        switch (b % 4) {
+            case 0: return 0;
+            case 1: return static_cast<std::int32_t>(in_.u32());
+            case 2: return static_cast<std::int32_t>(kSpecial[in_.byte() % kSpecial.size()]);
+            default: return static_cast<std::int8_t>(in_.byte());
+        }
+    }
+
+    // The bytes of a text file: lines made of the strings above, ended in
+    // every way, with blank lines, zero bytes and stray bytes between them.
+    std::string file() {
+        const std::size_t target = in_.byte() % kMaxFileBytes;
+        std::string bytes;
+        while (bytes.size() < target && !in_.exhausted()) {
+            const std::uint8_t b = in_.byte();
+            switch (b % 10) {
+                case 0: bytes += '\n'; break;
+                case 1: bytes += '\r'; break;
+                case 2: bytes += "\r\n"; break;
+                case 3: bytes += "\n\r"; break;
+                case 4: bytes += '\0'; break;
+                case 5: bytes += static_cast<char>(in_.byte()); break;
+                default: bytes += *text(false); break;
+            }
+        }
+        if (bytes.size() > kMaxFileBytes) {
+            bytes.resize(kMaxFileBytes);
+        }
+        return bytes;
+    }
+
+    std::int32_t balance() {
+        static constexpr std::array<std::int32_t, 4> kBalance = {0, 1, 2, -1};
+        const std::uint8_t b = in_.byte();
+        return b < 240 ? kBalance[b % 4] : static_cast<std::int32_t>(in_.u32());
+    }
+
+    // Values for the generator: some full-width (the library keeps 15 bits),
+    // some already 15-bit, some all alike, some straight from the input.
+    std::vector<int> draws(std::size_t needed) {
+        std::vector<int> out;
+        const std::size_t n = needed + 3;  // extra: a library that draws too often still gets values
+        out.reserve(n);
+        const std::uint8_t mode = in_.byte();
+        std::uint64_t state = in_.u16() * 0x9E3779B97F4A7C15ULL + mode;
+        const auto next = [&state] {
+            state += 0x9E3779B97F4A7C15ULL;
+            std::uint64_t z = state;
+            z = (z ^ (z >> 30)) * 0xBF58476D1CE4E5B9ULL;
+            z = (z ^ (z >> 27)) * 0x94D049BB133111EBULL;
+            return static_cast<int>((z ^ (z >> 31)) & 0x7FFFFFFF);
+        };
+        const int same = static_cast<int>(in_.u16());
+        for (std::size_t i = 0; i < n; ++i) {
+            switch (mode % 5) {
+                case 0: out.push_back(next()); break;
+                case 1: out.push_back(next() & 0x7FFF); break;
+                case 2: out.push_back(same); break;
+                case 3: out.push_back(i < 16 ? static_cast<int>(in_.u16()) : next()); break;
+                default: out.push_back(next() & 0xFF); break;
+            }
+        }
+        return out;
+    }
+
+private:
+    Input& in_;
+    Pool<std::int32_t> ints_;
+    Pool<std::uint32_t> floats_;
+    Pool<std::string> strings_;
+};
+
+// ------------------------------------------------------------ the file
+
+// One file per process, so parallel fuzzing jobs do not share it.
+const std::string& file_path() {
+    static const std::string path = [] {
+        const std::string p =
+            (std::filesystem::temp_directory_path() / ("sorvel-fuzz-" + std::to_string(::getpid()) + ".txt")).string();
+        std::atexit([] { std::remove(file_path().c_str()); });
+        return p;
+    }();
+    return path;
+}
+
+const std::string& missing_path() {
+    static const std::string path =
+        (std::filesystem::temp_directory_path() / ("sorvel-fuzz-" + std::to_string(::getpid()) + "-missing") /
+         "none.txt")
+            .string();
+    return path;
+}
+
+void write_file(const std::string& bytes) {
+    std::ofstream out(file_path(), std::ios::binary | std::ios::trunc);
+    out.write(bytes.data(), static_cast<std::streamsize>(bytes.size()));
+    out.close();
+    if (!out) {
+        std::fprintf(stderr, "fuzzer: cannot write %s\n", file_path().c_str());
+        std::abort();
+    }
+}
+
+// ------------------------------------------------------------ one instance
+
+struct Subject {
+    Instance* host = nullptr;
+    std::unique_ptr<fuzzmodel::Instance> model;
+    std::array<word, 3> indexes{};
+    word reader = 0;
+    int number = 0;
+};
+
+Param float_param(std::uint32_t bits) {
+    // The 32 bits exactly as the host gives a float, zero-extended.
+    return Param::raw_word(static_cast<word>(static_cast<std::uintptr_t>(bits)));
+}
+
+Param text_param(const Text& t) { return t ? Param::of(*t) : Param::null(); }
+
+// What one host routine call must look like; an argument of nullopt is not
+// checked (pointers the library takes from the host).
+struct ExpectedCall {
+    Routine routine;
+    std::vector<std::optional<word>> args;
+};
+
+const char* routine_name(Routine r) {
+    switch (r) {
+        case Routine::read_event_param: return "HostReadEventParam";
+        case Routine::read_first_expr_param: return "HostReadFirstExprParam";
+        case Routine::read_next_expr_param: return "HostReadNextExprParam";
+        case Routine::alloc_result_string: return "HostAllocResultString";
+        case Routine::open_file: return "HostOpenFile";
+        case Routine::close_file: return "HostCloseFile";
+    }
+    return "?";
+}
+
+class Session {
+public:
+    explicit Session(Input& in) : in_(in), values_(in), host_(Library::linked_in()) {}
+
+    void run() {
+        const std::size_t instances = 1 + in_.byte() % 3;
+        for (std::size_t i = 0; i < instances; ++i) {
+            subjects_.emplace_back();
+            create(subjects_.back(), static_cast<int>(i));
+        }
+        for (std::size_t n = 0; n < kMaxEvents && !in_.exhausted(); ++n) {
+            event_number_ = n;
+            one_event();
+        }
+        event_number_ = kMaxEvents;
+        for (Subject& s : subjects_) {
+            for (int c = 0; c < 3; ++c) {
+                compare_tree(s, c);
+            }
+            sweep(s);
+        }
+        for (Subject& s : subjects_) {
+            begin("DestroyRunObject", s);
+            host_.destroy(*s.host);
+        }
+    }
+
+private:
+    // -------------------------------------------------- bookkeeping
+
+    void begin(const std::string& what, const Subject& s) {
+        g_current = "#" + std::to_string(event_number_) + " instance " + std::to_string(s.number) + " (case " +
+                    std::to_string(s.model->case_word()) + ", index " + std::to_string(s.model->index_word()) +
+                    "): " + what;
+        g_history.push_back(g_current);
+        if (g_trace) {
+            std::fprintf(stderr, "%s\n", g_current.c_str());
+        }
+    }
+
+    void create(Subject& s, int number) {
+        const std::uint8_t options = in_.byte();
+        const std::int32_t case_word = kOptionWords[options & 3];
+        const std::int32_t index_word = kOptionWords[(options >> 2) & 3];
+        const auto creation8 = static_cast<std::int32_t>(static_cast<std::int16_t>(in_.u16()));
+        const auto creation12 = static_cast<std::int32_t>(static_cast<std::uint32_t>(options) * 0x91000193U);
+        s.number = number;
+        s.model = std::make_unique<fuzzmodel::Instance>(case_word, index_word);
+        begin("CreateRunObject", s);
+        s.host = &host_.create(case_word, index_word, creation8, creation12);
+        Instance& h = *s.host;
+        expect_equal(h.i32(RecordLayout::kCaseSensitive), case_word, "case-sensitive flag as stored");
+        expect_equal(h.i32(RecordLayout::kUseIndices), index_word, "use-indices flag as stored");
+        expect_equal(h.i32(RecordLayout::kCreationWordA), creation8, "creation word at byte 76");
+        expect_equal(h.i32(RecordLayout::kCreationWordB), creation12, "creation word at byte 84");
+        s.reader = h.pointer(RecordLayout::kReader);
+        if (s.reader == 0) {
+            mismatch("no ParamReader after CreateRunObject");
+        }
+        for (int c = 0; c < 3; ++c) {
+            s.indexes[static_cast<std::size_t>(c)] = h.index(c);
+            if ((h.index(c) != 0) != (index_word == 1)) {
+                mismatch("index " + std::to_string(c) + " present: " + std::to_string(h.index(c) != 0) +
+                         ", option word " + std::to_string(index_word));
+            }
+            expect_equal(h.count(c), 0, "count after creation");
+            expect_equal(h.root(c), word{0}, "root after creation");
+        }
+        expect_equal(h.result_flags(), std::uint16_t{0}, "result flags after creation");
+        host_.clear_calls();
+        check_header(s);
+    }
+
+    // The library writes no header byte besides the two creation words and
+    // the result flags, and keeps its own fields that never change.
+    void check_header(const Subject& s) {
+        const unsigned char* r = s.host->record();
+        for (std::size_t b = 0; b < RecordLayout::kReader; ++b) {
+            const bool own = (b >= RecordLayout::kHeaderPointer && b < RecordLayout::kHeaderPointer + sizeof(word)) ||
+                             (b >= RecordLayout::kCreationWordA && b < RecordLayout::kCreationWordA + 4) ||
+                             (b >= RecordLayout::kCreationWordB && b < RecordLayout::kCreationWordB + 4) ||
+                             (b >= RecordLayout::kResultFlags && b < RecordLayout::kResultFlags + 2);
+            if (!own && r[b] != 0) {
+                mismatch("header byte " + std::to_string(b) + " written: " + std::to_string(r[b]));
+            }
+        }
+        expect_equal(s.host->pointer(RecordLayout::kReader), s.reader, "ParamReader pointer");
+        expect_equal(s.host->i32(RecordLayout::kCaseSensitive), s.model->case_word(), "case-sensitive flag");
+        expect_equal(s.host->i32(RecordLayout::kUseIndices), s.model->index_word(), "use-indices flag");
+        for (int c = 0; c < 3; ++c) {
+            expect_equal(s.host->index(c), s.indexes[static_cast<std::size_t>(c)], "index pointer");
+        }
+    }
+
+    void check_calls(const std::vector<ExpectedCall>& expected) {
+        const std::vector<HostCall>& got = host_.calls();
+        std::string listing;
+        for (const HostCall& c : got) {
+            listing += std::string(" ") + routine_name(c.routine) + "(";
+            for (std::size_t a = 0; a < c.args.size(); ++a) {
+                listing += (a == 0 ? "" : ",") + std::to_string(c.args[a]);
+            }
+            listing += ")";
+        }
+        if (got.size() != expected.size()) {
+            mismatch("host calls: " + std::to_string(got.size()) + " made, " + std::to_string(expected.size()) +
+                     " expected; made:" + listing);
+        }
+        for (std::size_t i = 0; i < got.size(); ++i) {
+            if (got[i].routine != expected[i].routine || got[i].args.size() != expected[i].args.size()) {
+                mismatch("host call " + std::to_string(i) + " is " + routine_name(got[i].routine) + ", expected " +
+                         routine_name(expected[i].routine) + "; made:" + listing);
+            }
+            for (std::size_t a = 0; a < got[i].args.size(); ++a) {
+                if (expected[i].args[a] && *expected[i].args[a] != got[i].args[a]) {
+                    mismatch(std::string("argument ") + std::to_string(a) + " of " + routine_name(got[i].routine) +
+                             ": " + std::to_string(got[i].args[a]) + ", expected " +
+                             std::to_string(*expected[i].args[a]) + "; made:" + listing);
+                }
+            }
+        }
+        expect_equal(host_.unconsumed_params(), std::size_t{0}, "parameters left unread");
+        expect_equal(host_.missing_params(), std::size_t{0}, "parameters read beyond those given");
+        expect_equal(host_.open_handles(), std::size_t{0}, "files left open");
+        expect_equal(host_.bad_closes(), std::size_t{0}, "closes of handles not open");
+    }
+
+    // Sets the stage for one handler call: result flags with a pattern that
+    // must survive, the calls list cleared, the generator scripted.
+    std::uint16_t prepare(Subject& s, std::vector<int> script) {
+        // Any bits, the two result bits included: none may be cleared.
+        const auto flags = static_cast<std::uint16_t>((event_number_ * 0x9E37U + 0x1234U) & 0xFFFFU);
+        s.host->set_result_flags(flags);
+        host_.clear_calls();
+        draws::script(std::move(script));
+        return flags;
+    }
+
+    void finish(Subject& s, std::uint16_t flags_before, std::uint16_t flags_added, std::size_t draws_used,
+                int touched) {
+        expect_equal(s.host->result_flags(), static_cast<std::uint16_t>(flags_before | flags_added), "result flags");
+        expect_equal(draws::made(), draws_used, "draws made");
+        for (int c = 0; c < 3; ++c) {
+            expect_equal(s.host->count(c), count_of(*s.model, c), "count of collection " + std::to_string(c));
+        }
+        check_header(s);
+        if (touched >= 0) {
+            compare_tree(s, touched);
+        }
+    }
+
+    static std::int32_t count_of(const fuzzmodel::Instance& m, int c) {
+        switch (c) {
+            case kIntegers: return m.integers_size();
+            case kFloats: return m.floats_size();
+            default: return m.strings_size();
+        }
+    }
+
+    // Walks both trees side by side; a missing or extra node, or a value
+    // that differs (floats by their bits), is a mismatch.
+    template <class V, class Same, class Show>
+    void walk(word root, const fuzzmodel::Collection<V>& c, const Same& same, const Show& describe,
+              const std::string& name) {
+        std::vector<std::pair<NodeView, int>> pending{{NodeView{root}, c.root}};
+        std::size_t nodes = 0;
+        while (!pending.empty()) {
+            const auto [lib, mod] = pending.back();
+            pending.pop_back();
+            const std::string where = name + " tree, under model node " + std::to_string(mod);
+            if (static_cast<bool>(lib) != (mod != fuzzmodel::kNone)) {
+                mismatch(where + ": library has " + (lib ? "a node" : "none") + ", model " +
+                         (mod != fuzzmodel::kNone ? "a node holding " + describe(c.at(mod).value) : "none"));
+            }
+            if (!lib) {
+                continue;
+            }
+            ++nodes;
+            if (!same(lib, c.at(mod).value)) {
+                mismatch(where + ": value differs, model " + describe(c.at(mod).value));
+            }
+            pending.emplace_back(lib.left(), c.at(mod).left);
+            pending.emplace_back(lib.right(), c.at(mod).right);
+        }
+        if (nodes != static_cast<std::size_t>(c.count)) {
+            mismatch(name + " model tree holds " + std::to_string(nodes) + " nodes, count " + std::to_string(c.count));
+        }
+    }
+
+    void compare_tree(Subject& s, int collection) {
+        const fuzzmodel::Instance& m = *s.model;
+        switch (collection) {
+            case kIntegers:
+                walk(
+                    s.host->root(kIntegers), m.integers(),
+                    [](NodeView n, std::int32_t v) { return n.integer() == v; },
+                    [](std::int32_t v) { return std::to_string(v); }, "integer");
+                break;
+            case kFloats:
+                walk(
+                    s.host->root(kFloats), m.floats(),
+                    [](NodeView n, float v) {
+                        return std::bit_cast<std::uint32_t>(n.floating()) == std::bit_cast<std::uint32_t>(v);
+                    },
+                    [](float v) { return show_float(std::bit_cast<std::uint32_t>(v)); }, "float");
+                break;
+            default:
+                walk(
+                    s.host->root(kStrings), m.strings(), [](NodeView n, const std::string& v) { return n.string() == v; },
+                    [](const std::string& v) { return show(v); }, "string");
+                break;
+        }
+    }
+
+    // -------------------------------------------------- handlers
+
+    ExpectedCall event_param(const Subject& s, word selector) {
+        return {Routine::read_event_param, {s.host->address(), selector, word{0}}};
+    }
+
+    ExpectedCall expr_param(const Subject& s, word type, std::int32_t param_word) {
+        // Only the low 16 bits of the parameter word reach the host, sign-extended.
+        const auto arrives = static_cast<word>(static_cast<std::int16_t>(static_cast<std::uint16_t>(param_word & 0xFFFF)));
+        return {Routine::read_first_expr_param, {s.host->address(), type, arrives}};
+    }
+
+    ExpectedCall result_space(const Subject& s, const std::string& text) {
+        return {Routine::alloc_result_string, {s.host->address(), word{0}, static_cast<word>(text.size() + 1)}};
+    }
+
+    void condition(Subject& s, std::size_t number) {
+        bool want = false;
+        Param p;
+        ExpectedCall call;
+        std::string what;
+        switch (number) {
+            case 0: {
+                const std::int32_t v = values_.integer();
+                want = s.model->contains_integer(v);
+                p = Param::of(v);
+                call = event_param(s, 0);
+                what = "Contains Integer " + std::to_string(v);
+                break;
+            }
+            case 1: {
+                const std::uint32_t bits = values_.float_bits();
+                want = s.model->contains_float(std::bit_cast<float>(bits));
+                p = float_param(bits);
+                call = event_param(s, 2);
+                what = "Contains Float " + show_float(bits);
+                break;
+            }
+            default: {
+                const Text t = values_.text();
+                want = s.model->contains_string(t);
+                p = text_param(t);
+                call = event_param(s, -1);
+                what = "Contains String " + show(t);
+                break;
+            }
+        }
+        begin(what, s);
+        const std::uint16_t flags = prepare(s, {});
+        const word got = host_.condition(*s.host, number, {p});
+        expect_equal(got, static_cast<word>(want ? 1 : 0), "condition result");
+        check_calls({call});
+        finish(s, flags, 0, 0, -1);
+    }
+
+    void action(Subject& s, std::size_t number) {
+        std::vector<Param> params;
+        std::vector<ExpectedCall> calls;
+        std::vector<int> script;
+        std::string what;
+        int touched = kIntegers;
+        fuzzmodel::Draws model_draws({});
+        std::optional<bool> opens;  // for Load From File: whether the file opens
+        switch (number) {
+            case 0:
+            case 1: {
+                const std::int32_t v = values_.integer();
+                if (number == 0) {
+                    what = "Add Integer " + std::to_string(v);
+                    s.model->add_integer(v);
+                } else {
+                    what = "Remove Integer " + std::to_string(v);
+                    s.model->remove_integer(v);
+                }
+                params = {Param::of(v)};
+                calls = {event_param(s, 0)};
+                break;
+            }
+            case 2:
+                what = "Clear Integers";
+                s.model->clear_integers();
+                break;
+            case 3:
+            case 4: {
+                const std::uint32_t bits = values_.float_bits();
+                const float v = std::bit_cast<float>(bits);
+                if (number == 3) {
+                    what = "Add Float " + show_float(bits);
+                    s.model->add_float(v);
+                } else {
+                    what = "Remove Float " + show_float(bits);
+                    s.model->remove_float(v);
+                }
+                params = {float_param(bits)};
+                calls = {event_param(s, 2)};
+                touched = kFloats;
+                break;
+            }
+            case 5:
+                what = "Clear Floats";
+                s.model->clear_floats();
+                touched = kFloats;
+                break;
+            case 6:
+            case 7: {
+                const Text t = values_.text();
+                if (number == 6) {
+                    what = "Add String " + show(t);
+                    s.model->add_string(t);
+                } else {
+                    what = "Remove String " + show(t);
+                    s.model->remove_string(t);
+                }
+                params = {text_param(t)};
+                calls = {event_param(s, -1)};
+                touched = kStrings;
+                break;
+            }
+            case 8:
+                what = "Clear Strings";
+                s.model->clear_strings();
+                touched = kStrings;
+                break;
+            default: {
+                touched = kStrings;
+                const std::uint8_t which = in_.byte() % 8;
+                std::optional<std::string> contents;
+                Text name;
+                if (which < 6) {
+                    contents = values_.file();
+                    write_file(*contents);
+                    name = file_path();
+                    opens = true;
+                } else if (which == 6) {
+                    name = missing_path();
+                    opens = false;
+                }
+                const std::int32_t balance = values_.balance();
+                const std::size_t lines = contents ? fuzzmodel::split_lines(*contents).size() : 0;
+                script = values_.draws(balance != 0 ? lines : 0);
+                model_draws = fuzzmodel::Draws(script);
+                s.model->load(contents, balance, model_draws);
+                what = "Load From File " + (contents ? "file " + show(*contents) : show(name)) + " balance " +
+                       std::to_string(balance);
+                params = {text_param(name), Param::of(balance)};
+                calls = {event_param(s, -1), event_param(s, 0)};
+                if (name) {
+                    calls.push_back({Routine::open_file, {std::nullopt, std::nullopt, word{0}}});
+                    if (*opens) {
+                        calls.push_back({Routine::close_file, {std::nullopt}});
+                    }
+                }
+                break;
+            }
+        }
+        begin(what, s);
+        const std::uint16_t flags = prepare(s, script);
+        const word got = host_.action(*s.host, number, std::move(params));
+        expect_equal(got, word{0}, "action result");
+        check_calls(calls);
+        if (opens) {
+            const std::vector<HostCall>& made = host_.calls();
+            const word handle = made[2].result;
+            if ((handle != -1) != *opens) {
+                mismatch("HostOpenFile gave " + std::to_string(handle) + " for " + (*opens ? "the file" : "a missing file"));
+            }
+            if (*opens && made[3].args[0] != handle) {
+                mismatch("HostCloseFile got " + std::to_string(made[3].args[0]) + ", not the handle " +
+                         std::to_string(handle));
+            }
+            // The name itself was the host's and is gone once the handler returned.
+            if (made[2].args[0] != made[0].result) {
+                mismatch("HostOpenFile got another pointer than the name the host gave");
+            }
+        }
+        finish(s, flags, 0, model_draws.used(), touched);
+    }
+
+    // Runs an expression and checks everything about it; used both for the
+    // input's expression events and for the sweeps over the indexes.
+    void expression(Subject& s, std::size_t number, std::optional<std::int32_t> integer_param,
+                    std::optional<std::uint32_t> float_param_bits, const std::optional<Text>& text_param_value,
+                    std::int32_t param_word, const std::vector<int>& script) {
+        const fuzzmodel::Instance& m = *s.model;
+        fuzzmodel::Draws model_draws(script);
+        std::vector<Param> params;
+        std::vector<ExpectedCall> calls;
+        std::string what = std::string(kExpressionNames[number]);
+        if (integer_param) {
+            params.push_back(Param::of(*integer_param));
+            calls.push_back(expr_param(s, 0, param_word));
+            what += std::to_string(*integer_param);
+        } else if (float_param_bits) {
+            params.push_back(float_param(*float_param_bits));
+            calls.push_back(expr_param(s, 2, param_word));
+            what += show_float(*float_param_bits);
+        } else if (text_param_value) {
+            params.push_back(text_param(*text_param_value));
+            calls.push_back(expr_param(s, 1, param_word));
+            what += show(*text_param_value);
+        }
+        what += ") word " + hex32(static_cast<std::uint32_t>(param_word));
+        begin(what, s);
+
+        enum class Result { integer, floating, text };
+        Result kind = Result::integer;
+        std::int32_t want_integer = 0;
+        std::uint32_t want_float = 0;
+        std::string want_text;
+        switch (number) {
+            case 0: want_integer = m.integers_size(); break;
+            case 1: want_integer = m.integers_random(model_draws); break;
+            case 2: want_integer = m.floats_size(); break;
+            case 3:
+                kind = Result::floating;
+                want_float = std::bit_cast<std::uint32_t>(m.floats_random(model_draws));
+                break;
+            case 4: want_integer = m.strings_size(); break;
+            case 5:
+                kind = Result::text;
+                want_text = m.strings_random(model_draws);
+                break;
+            case 6: want_integer = m.index_of_integer(*integer_param); break;
+            case 7: want_integer = m.integer_at(*integer_param); break;
+            case 8: want_integer = m.index_of_float(std::bit_cast<float>(*float_param_bits)); break;
+            case 9:
+                kind = Result::floating;
+                want_float = std::bit_cast<std::uint32_t>(m.float_at(*integer_param));
+                break;
+            case 10: want_integer = m.index_of_string(*text_param_value); break;
+            default:
+                kind = Result::text;
+                want_text = m.string_at(*integer_param);
+                break;
+        }
+        if (kind == Result::text) {
+            calls.push_back(result_space(s, want_text));
+        }
+
+        const std::uint16_t flags = prepare(s, script);
+        const word got = host_.expression(*s.host, number, std::move(params), static_cast<word>(param_word));
+        check_calls(calls);
+        const auto low = static_cast<std::uint32_t>(static_cast<std::uintptr_t>(got));
+        switch (kind) {
+            case Result::integer:
+                expect_equal(static_cast<std::int32_t>(low), want_integer, "integer result");
+                finish(s, flags, 0, model_draws.used(), -1);
+                break;
+            case Result::floating:
+                if (low != want_float) {
+                    mismatch("float result: library " + show_float(low) + ", model " + show_float(want_float));
+                }
+                finish(s, flags, kFloatFlag, model_draws.used(), -1);
+                break;
+            case Result::text:
+                if (got == 0 || got != host_.calls().back().result) {
+                    mismatch("string result is not the buffer the host gave");
+                }
+                expect_text(Host::text_at(got), want_text, "string result");
+                finish(s, flags, kStringFlag, model_draws.used(), -1);
+                break;
+        }
+    }
+
+    void expression_event(Subject& s, std::size_t number) {
+        const std::int32_t word_value = values_.param_word();
+        std::vector<int> script;
+        std::optional<std::int32_t> integer_param;
+        std::optional<std::uint32_t> float_bits;
+        std::optional<Text> text;
+        switch (number) {
+            case 1: script = values_.draws(s.model->height(kIntegers) + 1); break;
+            case 3: script = values_.draws(s.model->height(kFloats) + 1); break;
+            case 5: script = values_.draws(s.model->height(kStrings) + 1); break;
+            case 6: integer_param = values_.integer(); break;
+            case 7: integer_param = values_.position(s.model->integers_size()); break;
+            case 8: float_bits = values_.float_bits(); break;
+            case 9: integer_param = values_.position(s.model->floats_size()); break;
+            case 10: text = values_.text(); break;
+            case 11: integer_param = values_.position(s.model->strings_size()); break;
+            default: break;
+        }
+        expression(s, number, integer_param, float_bits, text, word_value, script);
+    }
+
+    // Every position of every index, one past each end, and the position of
+    // every held value, all through the expressions.
+    void sweep(Subject& s) {
+        const fuzzmodel::Instance& m = *s.model;
+        for (std::int32_t p = -1; p <= m.integers_size(); ++p) {
+            expression(s, 7, p, std::nullopt, std::nullopt, p, {});
+        }
+        for (std::int32_t p = -1; p <= m.floats_size(); ++p) {
+            expression(s, 9, p, std::nullopt, std::nullopt, p, {});
+        }
+        for (std::int32_t p = -1; p <= m.strings_size(); ++p) {
+            expression(s, 11, p, std::nullopt, std::nullopt, p, {});
+        }
+        for (const int slot : m.integers().index) {
+            expression(s, 6, m.integers().at(slot).value, std::nullopt, std::nullopt, 0, {});
+        }
+        for (const int slot : m.floats().index) {
+            expression(s, 8, std::nullopt, std::bit_cast<std::uint32_t>(m.floats().at(slot).value), std::nullopt, 0, {});
+        }
+        for (const int slot : m.strings().index) {
+            expression(s, 10, std::nullopt, std::nullopt, Text(m.strings().at(slot).value), 0, {});
+        }
+    }
+
+    void one_event() {
+        const std::uint8_t op = in_.byte();
+        Subject& s = subjects_[(op >> 5) % subjects_.size()];
+        const unsigned kind = op & 31U;
+        if (kind < 3) {
+            condition(s, kind);
+        } else if (kind < 13) {
+            action(s, kind - 3);
+        } else if (kind < 25) {
+            expression_event(s, kind - 13);
+        } else if (kind == 25) {
+            sweep(s);
+        } else if (kind == 26) {
+            begin("DestroyRunObject, then a new instance in its place", s);
+            host_.destroy(*s.host);
+            create(s, s.number);
+        } else if (kind == 27) {
+            for (Subject& each : subjects_) {
+                for (int c = 0; c < 3; ++c) {
+                    compare_tree(each, c);
+                }
+            }
+        } else {
+            // More adds than anything else, so that trees grow.
+            static constexpr std::array<std::size_t, 4> kAdds = {0, 6, 3, 6};
+            action(s, kAdds[kind - 28]);
+        }
+    }
+
+    static constexpr std::array<const char*, 12> kExpressionNames = {
+        "IntegersSize(",         "IntegersRandomElement(", "FloatsSize(",       "FloatsRandomElement(",
+        "StringsSize(",          "StringsRandomElement$(", "IndexOfIntegerElement(", "IntegerElementAt(",
+        "IndexOfFloatElement(", "FloatElementAt(",        "IndexOfStringElement(",  "StringElementAt$("};
+
+    Input& in_;
+    Values values_;
+    Host host_;
+    std::vector<Subject> subjects_;
+    std::size_t event_number_ = 0;
+};
+
+}  // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
+    g_history.clear();
+    g_current.clear();
+    Input in(data, size);
+    {
+        Session session(in);
+        session.run();
+    }
+    // Nothing of this input may stay allocated, or libFuzzer runs it again
+    // to look for a leak.
+    std::vector<std::string>().swap(g_history);
+    std::string().swap(g_current);
+    return 0;
+}

@@ -1,0 +1,281 @@
+// The insertion index and the position queries over it. A position is
+// defined by a scan of the index from position 0 for the first node whose
+// value equals the key; the library answers without scanning, so every
+// answer here is checked against that scan.
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cstdint>
+#include <limits>
+#include <random>
+#include <string>
+#include <type_traits>
+#include <vector>
+
+#include "tree_helpers.hpp"
+
+namespace sorvel::test {
+namespace {
+
+template <class V, class Key>
+std::int32_t scanned_position(const Holder<V>& h, const Key& key) {
+    if (h.index == nullptr) {
+        return -1;
+    }
+    for (std::uint32_t i = 0; i < h.index->size(); ++i) {
+        if constexpr (std::is_same_v<V, char*>) {
+            if (reference_compare(h.index->at(i)->value, key.c_str(), h.case_sensitive) == 0) {
+                return static_cast<std::int32_t>(i);
+            }
+        } else if (h.index->at(i)->value == key) {
+            return static_cast<std::int32_t>(i);
+        }
+    }
+    return -1;
+}
+
+template <class V>
+::testing::AssertionResult node_at_matches_index(Holder<V>& h) {
+    const Collection<V> c = h.view();
+    const std::int32_t size = h.index == nullptr ? 0 : static_cast<std::int32_t>(h.index->size());
+    for (std::int32_t i = 0; i < size; ++i) {
+        if (node_at(c, i) != h.index->at(static_cast<std::uint32_t>(i))) {
+            return ::testing::AssertionFailure() << "node_at(" << i << ") is not the index entry";
+        }
+    }
+    for (const std::int32_t outside : {-1, size, size + 1, std::numeric_limits<std::int32_t>::min(),
+                                       std::numeric_limits<std::int32_t>::max()}) {
+        if (node_at(c, outside) != nullptr) {
+            return ::testing::AssertionFailure() << "node_at(" << outside << ") is not null";
+        }
+    }
+    return ::testing::AssertionSuccess();
+}
+
+// Random adds and removes; after each, every probe's position is the scanned
+// one and the index is in insertion order.
+template <class V, class Make>
+void check_positions(std::uint32_t seed, bool case_sensitive, int steps, Make make,
+                     std::uint32_t restart_at = 0) {
+    using Value = decltype(make(std::declval<std::mt19937&>()));
+    std::mt19937 random(seed);
+    Holder<V> h(true, case_sensitive);
+    std::vector<Value> probes;
+    for (int step = 0; step < steps; ++step) {
+        const Value v = make(random);
+        probes.push_back(v);
+        if (random() % 3 != 0) {
+            do_add(h, v);
+        } else {
+            do_remove(h, probes[random() % probes.size()]);
+        }
+        if (restart_at != 0 && step == steps / 4) {
+            h.index->restart_numbering_at(restart_at);
+        }
+        ASSERT_TRUE(collection_is_sound(h)) << "step " << step;
+        ASSERT_TRUE(node_at_matches_index(h)) << "step " << step;
+        for (std::size_t p = probes.size() > 40 ? probes.size() - 40 : 0; p < probes.size(); ++p) {
+            ASSERT_EQ(do_position(h, probes[p]), scanned_position(h, probes[p]))
+                << "step " << step << " probe " << show(probes[p]);
+        }
+    }
+}
+
+TEST(Positions, EqualTheScanOfTheIndex) {
+    check_positions<std::int32_t>(21, false, 600, [](std::mt19937& r) {
+        return static_cast<std::int32_t>(r() % 120) - 60;
+    });
+    check_positions<float>(22, false, 600, [](std::mt19937& r) {
+        return r() % 10 == 0 ? -0.0F : static_cast<float>(static_cast<int>(r() % 120) - 60) / 2.0F;
+    });
+    for (const bool sensitive : {false, true}) {
+        check_positions<char*>(23, sensitive, 600, [](std::mt19937& r) {
+            const std::string alphabet = "aAbBcC_";
+            std::string s;
+            for (unsigned i = r() % 3; i > 0; --i) {
+                s += alphabet[r() % alphabet.size()];
+            }
+            return s;
+        });
+    }
+}
+
+// Order numbers run out near the top of their range and start afresh; the
+// positions must stay right across that.
+TEST(Positions, SurviveOrderNumberWrapAround) {
+    constexpr std::uint32_t kTop = std::numeric_limits<std::uint32_t>::max();
+    for (const std::uint32_t first : {kTop, kTop - 1, kTop - 2, kTop - 5, kTop - 40, kTop - 200}) {
+        SCOPED_TRACE(first);
+        check_positions<std::int32_t>(31, false, 300, [](std::mt19937& r) {
+            return static_cast<std::int32_t>(r() % 60);
+        }, first);
+        check_positions<char*>(32, false, 300, [](std::mt19937& r) {
+            return std::string(1, static_cast<char>('a' + r() % 26)) + std::string(r() % 2, 'q');
+        }, first);
+    }
+}
+
+TEST(Positions, WrapAroundDuringAppendsAndErases) {
+    constexpr std::uint32_t kTop = std::numeric_limits<std::uint32_t>::max();
+    Ints h(true);
+    std::vector<std::int32_t> order;
+    for (std::int32_t v = 0; v < 10; ++v) {
+        do_add(h, v * 10);
+        order.push_back(v * 10);
+    }
+    h.index->restart_numbering_at(kTop - 3);
+    // Each round appends two and erases one from the front half, so the
+    // numbering wraps in the first rounds and many times over afterwards.
+    for (std::int32_t round = 0; round < 60; ++round) {
+        for (const std::int32_t v : {1000 + 2 * round, 1001 + 2 * round}) {
+            do_add(h, v);
+            order.push_back(v);
+        }
+        const std::size_t at = static_cast<std::size_t>(round) % (order.size() / 2);
+        const std::int32_t gone = order[at];
+        do_remove(h, gone);
+        order.erase(order.begin() + static_cast<std::ptrdiff_t>(at));
+        if (round % 5 == 0) {
+            h.index->restart_numbering_at(kTop - static_cast<std::uint32_t>(round % 3));
+        }
+        std::vector<std::string> want;
+        for (const std::int32_t v : order) {
+            want.push_back(std::to_string(v));
+        }
+        ASSERT_EQ(index_values(h), want) << "round " << round;
+        for (std::size_t i = 0; i < order.size(); ++i) {
+            ASSERT_EQ(do_position(h, order[i]), static_cast<std::int32_t>(i)) << "round " << round;
+        }
+        ASSERT_EQ(do_position(h, gone), -1);
+    }
+}
+
+TEST(Positions, IntegerExamples) {
+    Ints h(true);
+    for (const std::int32_t v : {30, 10, 20}) {
+        do_add(h, v);
+    }
+    const IntegerCollection c = h.view();
+    ASSERT_NE(node_at(c, 0), nullptr);
+    EXPECT_EQ(node_at(c, 0)->value, 30);
+    EXPECT_EQ(node_at(c, 1)->value, 10);
+    EXPECT_EQ(node_at(c, 2)->value, 20);
+    EXPECT_EQ(node_at(c, 3), nullptr);
+    EXPECT_EQ(node_at(c, -1), nullptr);
+    EXPECT_EQ(do_position(h, 20), 2);
+    EXPECT_EQ(do_position(h, 25), -1);
+    do_remove(h, 10);
+    EXPECT_EQ(node_at(h.view(), 1)->value, 20);
+    EXPECT_EQ(do_position(h, 20), 1);
+    EXPECT_EQ(do_position(h, 10), -1);
+    EXPECT_EQ(node_at(h.view(), 2), nullptr);
+    do_clear(h);
+    for (const std::int32_t v : {30, 10, 20, 0}) {
+        EXPECT_EQ(do_position(h, v), -1);
+    }
+    for (const std::int32_t i : {0, 1, 2, -1}) {
+        EXPECT_EQ(node_at(h.view(), i), nullptr);
+    }
+}
+
+TEST(Positions, NoIndexMeansNoPositions) {
+    Ints ints(false);
+    Floats floats(false);
+    Strings strings(false);
+    for (const std::int32_t v : {1, 2, 3}) do_add(ints, v);
+    for (const float v : {1.0F, 2.0F}) do_add(floats, v);
+    for (const char* v : {"a", "b"}) do_add(strings, v);
+    EXPECT_EQ(ints.count, 3);
+    EXPECT_EQ(do_position(ints, 2), -1);
+    EXPECT_EQ(do_position(floats, 1.0F), -1);
+    EXPECT_EQ(do_position(strings, "a"), -1);
+    EXPECT_EQ(node_at(ints.view(), 0), nullptr);
+    EXPECT_EQ(node_at(floats.view(), 0), nullptr);
+    EXPECT_EQ(node_at(strings.view(), 0), nullptr);
+}
+
+TEST(Positions, FloatExamples) {
+    Floats h(true);
+    for (const float v : {2.5F, 0.0F, -1.0F}) {
+        do_add(h, v);
+    }
+    EXPECT_EQ(do_position(h, -0.0F), 1);
+    EXPECT_EQ(do_position(h, 0.0F), 1);
+    EXPECT_EQ(do_position(h, std::numeric_limits<float>::quiet_NaN()), -1);
+    EXPECT_EQ(do_position(h, -1.0F), 2);
+    Floats empty(true);
+    EXPECT_EQ(do_position(empty, 0.0F), -1);
+    EXPECT_EQ(node_at(empty.view(), 0), nullptr);
+}
+
+TEST(Positions, StringExamples) {
+    struct Case {
+        bool case_sensitive;
+        const char* probe;
+        std::int32_t position;
+    };
+    const std::vector<Case> cases = {
+        {false, "APPLE", 1}, {false, "apple", 1}, {false, "pear", 0}, {false, "FIG", 2}, {false, "fi", -1},
+        {true, "APPLE", -1}, {true, "apple", 1},  {true, "Pear", 0},  {true, "pear", -1}, {false, "", -1},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(std::string(c.probe) + (c.case_sensitive ? " sensitive" : " folded"));
+        Strings h(true, c.case_sensitive);
+        for (const char* s : {"Pear", "apple", "Fig"}) {
+            do_add(h, s);
+        }
+        EXPECT_EQ(do_position(h, c.probe), c.position);
+        if (c.position >= 0) {
+            EXPECT_EQ(reference_compare(node_at(h.view(), c.position)->value, c.probe, c.case_sensitive), 0);
+        }
+    }
+    Strings h(true, false);
+    for (const char* s : {"Pear", "apple", "Fig"}) {
+        do_add(h, s);
+    }
+    EXPECT_STREQ(node_at(h.view(), 1)->value, "apple");
+    do_remove(h, "Pear");
+    EXPECT_STREQ(node_at(h.view(), 0)->value, "apple");
+    EXPECT_EQ(do_position(h, "Fig"), 1);
+    do_add(h, "");
+    EXPECT_EQ(do_position(h, ""), 2);
+    EXPECT_STREQ(node_at(h.view(), 2)->value, "");
+}
+
+// The index class on its own: entries are nodes it does not own.
+TEST(InsertionIndexClass, AppendEraseAndPositionsAgreeWithAVector) {
+    std::vector<IntegerNode> nodes(200);
+    for (std::size_t i = 0; i < nodes.size(); ++i) {
+        nodes[i].value = static_cast<std::int32_t>(i);
+    }
+    InsertionIndex<IntegerNode> index;
+    std::vector<IntegerNode*> model;
+    std::vector<bool> held(nodes.size(), false);
+    std::mt19937 random(41);
+    for (int step = 0; step < 2000; ++step) {
+        const std::size_t pick = random() % nodes.size();
+        if (!held[pick]) {
+            ASSERT_TRUE(index.reserve_one());
+            index.append(&nodes[pick]);
+            model.push_back(&nodes[pick]);
+        } else {
+            index.erase(&nodes[pick]);
+            model.erase(std::find(model.begin(), model.end(), &nodes[pick]));
+        }
+        held[pick] = !held[pick];
+        if (step == 500 || step == 1500) {
+            index.restart_numbering_at(std::numeric_limits<std::uint32_t>::max() - 7);
+        }
+        ASSERT_EQ(index.size(), model.size());
+        for (std::size_t i = 0; i < nodes.size(); ++i) {
+            const auto at = std::find(model.begin(), model.end(), &nodes[i]);
+            const std::int32_t want = at == model.end() ? -1 : static_cast<std::int32_t>(at - model.begin());
+            ASSERT_EQ(index.position_of(&nodes[i]), want) << "step " << step << " node " << i;
+        }
+    }
+    index.clear();
+    EXPECT_TRUE(index.empty());
+}
+
+}  // namespace
+}  // namespace sorvel::test

@@ -1,0 +1,42 @@
+// The library linked into the program itself. The exports are found through
+// a table of the program's own functions rather than the dynamic loader:
+// a statically linked Windows program has no export table to search. This
+// object is pulled in only by programs that call Library::linked_in, which
+// are the ones that link the library.
+#include "host/exports.hpp"
+#include "test_host.hpp"
+
+using sorvel::testhost::word;
+
+// Declarations with the library's argument counts and calling convention,
+// so that on 32-bit Windows the decorated names match the definitions.
+#define TESTHOST_PARAMS_0 ()
+#define TESTHOST_PARAMS_1 (word)
+#define TESTHOST_PARAMS_2 (word, word)
+#define TESTHOST_PARAMS_3 (word, word, word)
+#define SORVEL_ARGS0 ()
+#define SORVEL_ARGS1 (word)
+#define SORVEL_ARGS2 (word, word)
+#define SORVEL_ARGS3 (word, word, word)
+#define SORVEL_ARGS4 (word, word, word, word)
+#define SORVEL_ARGS5 (word, word, word, word, word)
+#define SORVEL_ARGS7 (word, word, word, word, word, word, word)
+#define TESTHOST_DECLARE_EXPORT(name, ordinal, count) extern "C" word SORVEL_CALL name TESTHOST_PARAMS_##count;
+#define TESTHOST_DECLARE_STUB(name, ordinal, params, result) extern "C" word SORVEL_CALL name params;
+SORVEL_EXPORT_LIST(TESTHOST_DECLARE_EXPORT)
+SORVEL_STUB_LIST(TESTHOST_DECLARE_STUB)
+extern "C" word SORVEL_CALL DllMain(word, word, word);
+
+namespace sorvel::testhost {
+
+std::shared_ptr<Library> Library::linked_in() {
+    std::shared_ptr<Library> library(new Library());
+#define TESTHOST_ENTRY(name, ordinal, ...) library->symbols_.push_back(Symbol{#name, reinterpret_cast<void*>(&name)});
+    SORVEL_EXPORT_LIST(TESTHOST_ENTRY)
+    SORVEL_STUB_LIST(TESTHOST_ENTRY)
+#undef TESTHOST_ENTRY
+    library->symbols_.push_back(Symbol{"DllMain", reinterpret_cast<void*>(&DllMain)});
+    return library;
+}
+
+}  // namespace sorvel::testhost
