@@ -575,7 +575,7 @@ private:
     // must survive, the calls list cleared, the generator scripted.
     std::uint16_t prepare(Subject& s, std::vector<int> script) {
         // Any bits, the two result bits included: none may be cleared.
-        const auto flags = static_cast<std::uint16_t>((event_number_ * 0x9E37U + 0x1234U) & 0xFFFFU);
+        const auto flags = static_cast<std::uint16_t>((++handler_calls_ * 0x9E37U + 0x1234U) & 0xFFFFU);
         s.host->set_result_flags(flags);
         host_.clear_calls();
         draws::script(std::move(script));
@@ -1006,6 +1006,7 @@ private:
     Host host_;
     std::vector<Subject> subjects_;
     std::size_t event_number_ = 0;
+    std::size_t handler_calls_ = 0;
 };
 
 }  // namespace
