@@ -22,6 +22,7 @@
 #include <utility>
 #include <vector>
 
+#include "collections/memory.hpp"
 #include "model.hpp"
 #include "test_host.hpp"
 
@@ -42,6 +43,7 @@ using Text = fuzzmodel::Instance::Text;
 // Bounds that keep one execution in the millisecond range.
 constexpr std::size_t kMaxEvents = 256;
 constexpr std::size_t kMaxFileBytes = 160;
+constexpr std::size_t kMaxManyLines = 700;
 constexpr std::size_t kPoolSize = 48;
 constexpr std::size_t kHistory = 40;
 
@@ -316,7 +318,11 @@ public:
     // The bytes of a text file: lines made of the strings above, ended in
     // every way, with blank lines, zero bytes and stray bytes between them.
     std::string file() {
-        const std::size_t target = in_.byte() % kMaxFileBytes;
+        const std::uint8_t shape = in_.byte();
+        if (shape >= 224) {
+            return many_lines();
+        }
+        const std::size_t target = shape % kMaxFileBytes;
         std::string bytes;
         while (bytes.size() < target && !in_.exhausted()) {
             const std::uint8_t b = in_.byte();
@@ -336,6 +342,32 @@ public:
         return bytes;
     }
 
+    // Hundreds of short lines, so that balanced loading has long lists to
+    // pick from: numbers below a modulus (small ones repeat), optionally
+    // with letters in either case, zero bytes and blank lines, or sorted.
+    std::string many_lines() {
+        const std::size_t lines = 60 + in_.u16() % (kMaxManyLines - 59);
+        const std::uint32_t modulus = 1U + in_.u16();
+        const std::uint8_t style = in_.byte();
+        std::uint64_t state = in_.u32();
+        static constexpr std::array<const char*, 5> kEnds = {"\n", "\r\n", "\r", "\n\n", "\n\r"};
+        std::string bytes;
+        for (std::size_t i = 0; i < lines; ++i) {
+            const std::uint64_t r = mix(state);
+            std::string line = (style & 8) != 0 ? std::to_string(100000 + i) : std::to_string(r % modulus);
+            if ((style & 1) != 0) {
+                line.insert(line.begin(), ((r >> 40) & 1) != 0 ? 'A' : 'a');
+            }
+            if ((style & 2) != 0 && ((r >> 20) & 15) == 0) {
+                line += '\0';
+                line += 'x';
+            }
+            bytes += line;
+            bytes += kEnds[(r >> 32) % kEnds.size()];
+        }
+        return bytes;
+    }
+
     std::int32_t balance() {
         static constexpr std::array<std::int32_t, 4> kBalance = {0, 1, 2, -1};
         const std::uint8_t b = in_.byte();
@@ -350,13 +382,7 @@ public:
         out.reserve(n);
         const std::uint8_t mode = in_.byte();
         std::uint64_t state = in_.u16() * 0x9E3779B97F4A7C15ULL + mode;
-        const auto next = [&state] {
-            state += 0x9E3779B97F4A7C15ULL;
-            std::uint64_t z = state;
-            z = (z ^ (z >> 30)) * 0xBF58476D1CE4E5B9ULL;
-            z = (z ^ (z >> 27)) * 0x94D049BB133111EBULL;
-            return static_cast<int>((z ^ (z >> 31)) & 0x7FFFFFFF);
-        };
+        const auto next = [&state] { return static_cast<int>(mix(state) & 0x7FFFFFFF); };
         const int same = static_cast<int>(in_.u16());
         for (std::size_t i = 0; i < n; ++i) {
             switch (mode % 5) {
@@ -371,6 +397,15 @@ public:
     }
 
 private:
+    // splitmix64: a stream of well-mixed values from one seed.
+    static std::uint64_t mix(std::uint64_t& state) {
+        state += 0x9E3779B97F4A7C15ULL;
+        std::uint64_t z = state;
+        z = (z ^ (z >> 30)) * 0xBF58476D1CE4E5B9ULL;
+        z = (z ^ (z >> 27)) * 0x94D049BB133111EBULL;
+        return z ^ (z >> 31);
+    }
+
     Input& in_;
     Pool<std::int32_t> ints_;
     Pool<std::uint32_t> floats_;
@@ -713,7 +748,13 @@ private:
         finish(s, flags, 0, 0, -1);
     }
 
-    void action(Subject& s, std::size_t number) {
+    // `failing_allocation`: for an add, the library's allocation (counted
+    // from 0 within the event) that is made to fail, or -1.
+    void action(Subject& s, std::size_t number, long failing_allocation = -1) {
+        std::optional<fuzzmodel::Instance> before;
+        if (failing_allocation >= 0) {
+            before.emplace(*s.model);
+        }
         std::vector<Param> params;
         std::vector<ExpectedCall> calls;
         std::vector<int> script;
@@ -800,8 +841,12 @@ private:
                 script = values_.draws(balance != 0 ? lines : 0);
                 model_draws = fuzzmodel::Draws(script);
                 s.model->load(contents, balance, model_draws);
-                what = "Load From File " + (contents ? "file " + show(*contents) : show(name)) + " balance " +
-                       std::to_string(balance);
+                what = "Load From File " +
+                       (contents ? "file of " + std::to_string(contents->size()) + " bytes, " + std::to_string(lines) +
+                                       " lines: " + show(contents->substr(0, 96)) +
+                                       (contents->size() > 96 ? "..." : "")
+                                 : show(name)) +
+                       " balance " + std::to_string(balance);
                 params = {text_param(name), Param::of(balance)};
                 calls = {event_param(s, -1), event_param(s, 0)};
                 if (name) {
@@ -813,11 +858,21 @@ private:
                 break;
             }
         }
+        if (failing_allocation >= 0) {
+            what += ", allocation " + std::to_string(failing_allocation) + " failing";
+        }
         begin(what, s);
         const std::uint16_t flags = prepare(s, script);
+        sorvel::memory::fail_allocation_after(failing_allocation);
         const word got = host_.action(*s.host, number, std::move(params));
+        sorvel::memory::fail_allocation_after(-1);
         expect_equal(got, word{0}, "action result");
         check_calls(calls);
+        if (before && s.host->count(touched) == count_of(*before, touched)) {
+            // The library promises all or nothing when memory runs out: an
+            // add that did not happen must have left everything as it was.
+            *s.model = *before;
+        }
         if (opens) {
             const std::vector<HostCall>& made = host_.calls();
             const word handle = made[2].result;
@@ -989,10 +1044,14 @@ private:
                     compare_tree(each, c);
                 }
             }
-        } else {
+        } else if (kind < 31) {
             // More adds than anything else, so that trees grow.
-            static constexpr std::array<std::size_t, 4> kAdds = {0, 6, 3, 6};
+            static constexpr std::array<std::size_t, 3> kAdds = {0, 6, 3};
             action(s, kAdds[kind - 28]);
+        } else {
+            static constexpr std::array<std::size_t, 3> kAdds = {0, 3, 6};
+            const std::uint8_t b = in_.byte();
+            action(s, kAdds[b % 3], (b >> 2) % 3);
         }
     }
 

@@ -117,23 +117,40 @@ struct Handler {
 };
 
 const std::vector<Handler> kHandlers = {
-    {"sorvel_contains_integer", 3}, {"sorvel_contains_float", 3},       {"sorvel_contains_string", 3},
-    {"sorvel_add_integer", 3},      {"sorvel_remove_integer", 3},       {"sorvel_clear_integers", 3},
-    {"sorvel_add_float", 3},        {"sorvel_remove_float", 3},         {"sorvel_clear_floats", 3},
-    {"sorvel_add_string", 3},       {"sorvel_remove_string", 3},        {"sorvel_clear_strings", 3},
-    {"sorvel_load_from_file", 3},   {"sorvel_integers_size", 2},        {"sorvel_integers_random_element", 2},
-    {"sorvel_floats_size", 2},      {"sorvel_floats_random_element", 2}, {"sorvel_strings_size", 2},
-    {"sorvel_strings_random_element", 2}, {"sorvel_index_of_integer", 2}, {"sorvel_integer_at", 2},
-    {"sorvel_index_of_float", 2},   {"sorvel_float_at", 2},             {"sorvel_index_of_string", 2},
+    {"sorvel_contains_integer", 3},
+    {"sorvel_contains_float", 3},
+    {"sorvel_contains_string", 3},
+    {"sorvel_add_integer", 3},
+    {"sorvel_remove_integer", 3},
+    {"sorvel_clear_integers", 3},
+    {"sorvel_add_float", 3},
+    {"sorvel_remove_float", 3},
+    {"sorvel_clear_floats", 3},
+    {"sorvel_add_string", 3},
+    {"sorvel_remove_string", 3},
+    {"sorvel_clear_strings", 3},
+    {"sorvel_load_from_file", 3},
+    {"sorvel_integers_size", 2},
+    {"sorvel_integers_random_element", 2},
+    {"sorvel_floats_size", 2},
+    {"sorvel_floats_random_element", 2},
+    {"sorvel_strings_size", 2},
+    {"sorvel_strings_random_element", 2},
+    {"sorvel_index_of_integer", 2},
+    {"sorvel_integer_at", 2},
+    {"sorvel_index_of_float", 2},
+    {"sorvel_float_at", 2},
+    {"sorvel_index_of_string", 2},
     {"sorvel_string_at", 2},
 };
 
 // System DLLs present on every Windows the host runs on. No runtime DLL of
 // the compiler (libstdc++, libgcc, winpthread) may be needed.
-const std::set<std::string> kAllowedImports = {"kernel32.dll", "msvcrt.dll", "ntdll.dll", "advapi32.dll",
-                                               "user32.dll"};
+const std::set<std::string> kAllowedImports = {"kernel32.dll", "msvcrt.dll", "ntdll.dll", "advapi32.dll", "user32.dll"};
 
-std::string decorated(const std::string& name, int args) { return "_" + name + "@" + std::to_string(4 * args); }
+std::string decorated(const std::string& name, int args) {
+    return "_" + name + "@" + std::to_string(4 * args);
+}
 
 std::string lower(std::string s) {
     std::transform(s.begin(), s.end(), s.begin(), [](unsigned char c) { return static_cast<char>(std::tolower(c)); });
@@ -195,8 +212,8 @@ struct Headers {
     std::string format;
     unsigned long image_base = 0;
     std::optional<int> ordinal_base;
-    std::map<std::string, int> named;           // name -> ordinal
-    std::map<int, unsigned long> address_table;  // ordinal -> RVA
+    std::map<std::string, int> named;                      // name -> ordinal
+    std::map<int, unsigned long> address_table;            // ordinal -> RVA
     std::map<std::string, std::set<std::string>> imports;  // DLL (lower case) -> members
 };
 
@@ -209,7 +226,9 @@ std::vector<std::string> tokens_of(const std::string& line) {
     return tokens;
 }
 
-bool starts_with(const std::string& s, const std::string& prefix) { return s.rfind(prefix, 0) == 0; }
+bool starts_with(const std::string& s, const std::string& prefix) {
+    return s.rfind(prefix, 0) == 0;
+}
 
 bool all_of_class(const std::string& s, int (*klass)(int)) {
     return !s.empty() && std::all_of(s.begin(), s.end(), [klass](unsigned char c) { return klass(c) != 0; });
@@ -393,7 +412,9 @@ protected:
 Headers* ProductDll::headers_ = nullptr;
 Disassembly* ProductDll::disassembly_ = nullptr;
 
-TEST_F(ProductDll, IsA32BitWindowsImage) { EXPECT_EQ(headers_->format, "pei-i386"); }
+TEST_F(ProductDll, IsA32BitWindowsImage) {
+    EXPECT_EQ(headers_->format, "pei-i386");
+}
 
 TEST_F(ProductDll, ExportsExactlyTheHostsNamesAndOrdinals) {
     const Headers& h = *headers_;

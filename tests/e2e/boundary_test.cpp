@@ -3,6 +3,7 @@
 // how handlers fetch their parameters and how they hand results back.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <array>
 #include <bit>
 #include <cstdint>
@@ -10,6 +11,8 @@
 #include <filesystem>
 #include <fstream>
 #include <optional>
+#include <random>
+#include <stdexcept>
 #include <string>
 #include <thread>
 #include <vector>
@@ -45,8 +48,8 @@ struct ExportEntry {
 };
 
 const std::vector<ExportEntry> kWorking = {
-    {"GetInfos", 2, 1, {}},          {"GetRunObjectInfos", 59, 2, {}}, {"GetRunObjectDataSize", 80, 2, {}},
-    {"CreateRunObject", 50, 3, {}},  {"DestroyRunObject", 51, 2, {}},  {"HandleRunObject", 52, 1, {}},
+    {"GetInfos", 2, 1, {}},         {"GetRunObjectInfos", 59, 2, {}}, {"GetRunObjectDataSize", 80, 2, {}},
+    {"CreateRunObject", 50, 3, {}}, {"DestroyRunObject", 51, 2, {}},  {"HandleRunObject", 52, 1, {}},
 };
 
 const std::vector<ExportEntry> kStubs = {
@@ -215,9 +218,9 @@ TEST_F(HostTest, GetInfosAnswersEachCode) {
         word code;
         word answer;
     };
-    const std::vector<Case> cases = {{0, 768}, {1, 0}, {2, 256}, {3, 0},  {4, 0},         {5, 0},
-                                     {6, 2},   {7, 247}, {8, 0}, {-1, 0}, {0x100, 0},     {0x10002, 0},
-                                     {9, 0},   {0x7FFFFFFF, 0}, {-0x7FFFFFFF - 1, 0}};
+    const std::vector<Case> cases = {{0, 768},   {1, 0},       {2, 256}, {3, 0},          {4, 0},
+                                     {5, 0},     {6, 2},       {7, 247}, {8, 0},          {-1, 0},
+                                     {0x100, 0}, {0x10002, 0}, {9, 0},   {0x7FFFFFFF, 0}, {-0x7FFFFFFF - 1, 0}};
     for (const Case& c : cases) {
         EXPECT_EQ(host.library().call_export("GetInfos", {c.code}), c.answer) << "code " << c.code;
     }
@@ -278,7 +281,8 @@ TEST_F(HostTest, GetRunObjectInfosFillsTheBlock) {
         for (word first : {word{0}, word{-1}, word{0x1234}}) {
             SCOPED_TRACE(testing::Message() << "fill " << int{fill} << ", first word " << first);
             std::vector<unsigned char> block(RecordLayout::kInfoSize + 32, fill);
-            EXPECT_EQ(host.library().call_export("GetRunObjectInfos", {first, reinterpret_cast<word>(block.data())}), 1);
+            EXPECT_EQ(host.library().call_export("GetRunObjectInfos", {first, reinterpret_cast<word>(block.data())}),
+                      1);
             EXPECT_NE(word_at(block, RecordLayout::kInfoConditions), 0);
             EXPECT_NE(word_at(block, RecordLayout::kInfoActions), 0);
             EXPECT_NE(word_at(block, RecordLayout::kInfoExpressions), 0);
@@ -374,7 +378,7 @@ const std::vector<CreateCase> kCreateCases = {
     {1, 0, 1, 2},
     {0, 1, -1, 0x7FFFFFFF},
     {1, 1, 0x12345678, -0x12345678},
-    {2, 2, 76, 84},                        // 2 stays 2 and counts as off
+    {2, 2, 76, 84},  // 2 stays 2 and counts as off
     {-1, -1, -0x7FFFFFFF - 1, 5},
     {0x10001, 0x10001, 0x10001, 0x10001},  // low bits 1, still off
     {0x7FFFFFFF, 0x100, 0, -1},
@@ -410,7 +414,8 @@ TEST_F(HostTest, CreateRunObjectCopiesOptionsAndCreationWords) {
         // Of the host's header only bytes 76 and 84 are written.
         const std::vector<unsigned char> bytes = record_bytes(instance);
         for (std::size_t i = 0; i < RecordLayout::kReader; ++i) {
-            const bool header_pointer = i >= RecordLayout::kHeaderPointer && i < RecordLayout::kHeaderPointer + sizeof(word);
+            const bool header_pointer =
+                i >= RecordLayout::kHeaderPointer && i < RecordLayout::kHeaderPointer + sizeof(word);
             const bool written = (i >= 76 && i < 80) || (i >= 84 && i < 88);
             if (!header_pointer && !written) {
                 ASSERT_EQ(bytes[i], 0) << "header byte " << i;
@@ -602,9 +607,9 @@ TEST_F(HostTest, OnlyTheLowSixteenBitsOfTheParameterWordReachTheHost) {
         {1, 1},
         {0x7FFF, 0x7FFF},
         {0x8000, -0x8000},
-        {0xFFFF, -1},           // 2^16 - 1
+        {0xFFFF, -1},  // 2^16 - 1
         {0x10000, 0},
-        {0x10001, 1},           // 2^16 + 1
+        {0x10001, 1},  // 2^16 + 1
         {-1, -1},
         {-2, -2},
         {0x12345678, 0x5678},
@@ -659,9 +664,11 @@ TEST_F(HostTest, LoadFromFileReadsNameThenFlagBeforeOpening) {
 class FileTest : public HostTest {
 protected:
     void SetUp() override {
-        dir_ = std::filesystem::temp_directory_path() /
-               ("sorvel-boundary-" + std::to_string(reinterpret_cast<std::uintptr_t>(this) % 1000003));
-        std::filesystem::create_directories(dir_);
+        // A fresh directory of its own, also when other builds run these tests.
+        std::random_device entropy;
+        do {
+            dir_ = std::filesystem::temp_directory_path() / ("sorvel-boundary-" + std::to_string(entropy()));
+        } while (!std::filesystem::create_directories(dir_));
     }
     void TearDown() override {
         HostTest::TearDown();
@@ -711,14 +718,14 @@ TEST_F(FileTest, ADirectoryDoesNotOpen) {
 // ------------------------------------------------------------ results
 
 TEST_F(HostTest, FloatExpressionsMarkTheirResultEvenForZero) {
-    for (std::uint16_t preset : {std::uint16_t{0}, std::uint16_t{1}, std::uint16_t{0x8000}, std::uint16_t{0x4000},
-                                 std::uint16_t{0x3FFF}}) {
+    for (std::uint16_t preset :
+         {std::uint16_t{0}, std::uint16_t{1}, std::uint16_t{0x8000}, std::uint16_t{0x4000}, std::uint16_t{0x3FFF}}) {
         for (std::size_t number : {std::size_t{3}, std::size_t{9}}) {
             SCOPED_TRACE(testing::Message() << "expression " << number << ", flags " << preset);
             Instance& instance = host.create(0, 1);
             instance.set_result_flags(preset);
-            const word result = host.expression(instance, number, number == 9 ? std::vector{Param::of(std::int32_t{0})}
-                                                                              : std::vector<Param>{});
+            const word result = host.expression(
+                instance, number, number == 9 ? std::vector{Param::of(std::int32_t{0})} : std::vector<Param>{});
             EXPECT_EQ(result, 0) << "the bits of +0.0";
             EXPECT_EQ(instance.result_flags(), preset | 0x4000);
             host.destroy(instance);
@@ -758,8 +765,8 @@ TEST_F(HostTest, EmptyStringResultTakesAOneByteBuffer) {
             Instance& instance = host.create(0, 1);
             instance.set_result_flags(preset);
             host.clear_calls();
-            const word result = host.expression(instance, number, number == 11 ? std::vector{Param::of(std::int32_t{0})}
-                                                                               : std::vector<Param>{});
+            const word result = host.expression(
+                instance, number, number == 11 ? std::vector{Param::of(std::int32_t{0})} : std::vector<Param>{});
             const std::vector<HostCall> allocs = calls_of(host, {Routine::alloc_result_string});
             ASSERT_EQ(allocs.size(), 1U);
             EXPECT_EQ(allocs[0].args, (std::vector<word>{instance.address(), 0, 1}));
@@ -777,8 +784,8 @@ TEST_F(HostTest, StringResultIsCopiedIntoHostSpace) {
     host.action(instance, 6, {Param::of("hello")});
     for (std::size_t number : {std::size_t{5}, std::size_t{11}}) {
         host.clear_calls();
-        const word result = host.expression(instance, number, number == 11 ? std::vector{Param::of(std::int32_t{0})}
-                                                                           : std::vector<Param>{});
+        const word result = host.expression(
+            instance, number, number == 11 ? std::vector{Param::of(std::int32_t{0})} : std::vector<Param>{});
         const std::vector<HostCall> allocs = calls_of(host, {Routine::alloc_result_string});
         ASSERT_EQ(allocs.size(), 1U);
         EXPECT_EQ(allocs[0].args[2], 6);
@@ -798,8 +805,8 @@ TEST_F(HostTest, NoResultBufferGivesAnEmptyString) {
         for (std::size_t number : {std::size_t{5}, std::size_t{11}}) {
             SCOPED_TRACE(testing::Message() << "expression " << number << (filled ? ", filled" : ", empty"));
             host.clear_calls();
-            const word result = host.expression(instance, number, number == 11 ? std::vector{Param::of(std::int32_t{0})}
-                                                                               : std::vector<Param>{});
+            const word result = host.expression(
+                instance, number, number == 11 ? std::vector{Param::of(std::int32_t{0})} : std::vector<Param>{});
             EXPECT_EQ(host.calls_to(Routine::alloc_result_string), 1U);
             ASSERT_NE(result, 0);
             EXPECT_EQ(Host::text_at(result), "");

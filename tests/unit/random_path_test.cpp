@@ -200,8 +200,8 @@ TEST(RandomPath, DeepPathsPickAtDepthKPlusOne) {
         for (const DeepCase& c : cases) {
             SCOPED_TRACE(std::string(c.name) + (leans_right ? ", right chain" : ", left chain"));
             // Follow the chain for walked - 1 steps, then turn off it.
-            std::vector<int> draws(static_cast<std::size_t>(c.walked), leans_right ? 1 : 0);
-            draws.back() = leans_right ? 0 : 1;
+            std::vector<int> draws(static_cast<std::size_t>(c.walked - 1), leans_right ? 1 : 0);
+            draws.push_back(leans_right ? 0 : 1);
             draws.push_back(c.last);
             Script library{draws};
             Script naive{draws};

@@ -65,14 +65,18 @@ std::vector<int> reseed(unsigned seed, std::size_t n) {
     return values;
 }
 
-bool scriptable() { return true; }
+bool scriptable() {
+    return true;
+}
 
 void script(std::vector<int> values) {
     g_script.assign(values.begin(), values.end());
     g_made = 0;
 }
 
-std::size_t made() { return g_made; }
+std::size_t made() {
+    return g_made;
+}
 
 int next_value() {
     ++g_made;
@@ -86,7 +90,9 @@ int next_value() {
 
 }  // namespace sorvel::testhost::draws
 
-extern "C" int rand() noexcept { return sorvel::testhost::draws::next_value(); }
+extern "C" int rand() noexcept {
+    return sorvel::testhost::draws::next_value();
+}
 
 #else
 
@@ -116,9 +122,13 @@ std::vector<int> reseed(unsigned seed, std::size_t n) {
     return values;
 }
 
-bool scriptable() { return false; }
+bool scriptable() {
+    return false;
+}
 
-void script(std::vector<int>) { throw std::logic_error("the Windows runtime generator cannot be scripted"); }
+void script(std::vector<int>) {
+    throw std::logic_error("the Windows runtime generator cannot be scripted");
+}
 
 std::size_t made() {
     if (g_learnt.empty()) {

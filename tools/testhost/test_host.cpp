@@ -13,8 +13,12 @@
 #include "host/platform.hpp"
 
 #if defined(_WIN32)
+#ifndef WIN32_LEAN_AND_MEAN
 #define WIN32_LEAN_AND_MEAN
+#endif
+#ifndef NOMINMAX
 #define NOMINMAX
+#endif
 #include <windows.h>
 #else
 #include <dlfcn.h>
@@ -72,7 +76,9 @@ std::int32_t truncate(float value) {
     return static_cast<std::int32_t>(value);
 }
 
-word float_word(float value) { return static_cast<word>(static_cast<std::uintptr_t>(std::bit_cast<std::uint32_t>(value))); }
+word float_word(float value) {
+    return static_cast<word>(static_cast<std::uintptr_t>(std::bit_cast<std::uint32_t>(value)));
+}
 
 }  // namespace
 
@@ -151,15 +157,17 @@ void* Library::symbol_by_ordinal(int ordinal) const {
     if (handle_ == nullptr || ordinal <= 0 || ordinal > 0xFFFF) {
         return nullptr;
     }
-    return reinterpret_cast<void*>(GetProcAddress(reinterpret_cast<HMODULE>(handle_),
-                                                  MAKEINTRESOURCEA(static_cast<WORD>(ordinal))));
+    return reinterpret_cast<void*>(
+        GetProcAddress(reinterpret_cast<HMODULE>(handle_), MAKEINTRESOURCEA(static_cast<WORD>(ordinal))));
 #else
     (void)ordinal;
     return nullptr;
 #endif
 }
 
-word Library::module_handle() const { return reinterpret_cast<word>(handle_); }
+word Library::module_handle() const {
+    return reinterpret_cast<word>(handle_);
+}
 
 void* Library::entry_point() const {
 #if defined(_WIN32)
@@ -187,8 +195,7 @@ word Library::call(void* function, std::initializer_list<word> args) const {
     }
 #if defined(TESTHOST_CHECKED_CALLS)
     word delta = 0;
-    const word result =
-        sorvel_testhost_stdcall_call(function, args.begin(), static_cast<word>(args.size()), &delta);
+    const word result = sorvel_testhost_stdcall_call(function, args.begin(), static_cast<word>(args.size()), &delta);
     if (delta != 0) {
         ++g_stack_errors;
     }
@@ -200,11 +207,10 @@ word Library::call(void* function, std::initializer_list<word> args) const {
         case 1: return reinterpret_cast<word(TESTHOST_CALL*)(word)>(function)(a[0]);
         case 2: return reinterpret_cast<word(TESTHOST_CALL*)(word, word)>(function)(a[0], a[1]);
         case 3: return reinterpret_cast<word(TESTHOST_CALL*)(word, word, word)>(function)(a[0], a[1], a[2]);
-        case 4:
-            return reinterpret_cast<word(TESTHOST_CALL*)(word, word, word, word)>(function)(a[0], a[1], a[2], a[3]);
+        case 4: return reinterpret_cast<word(TESTHOST_CALL*)(word, word, word, word)>(function)(a[0], a[1], a[2], a[3]);
         case 5:
             return reinterpret_cast<word(TESTHOST_CALL*)(word, word, word, word, word)>(function)(a[0], a[1], a[2],
-                                                                                                 a[3], a[4]);
+                                                                                                  a[3], a[4]);
         case 6:
             return reinterpret_cast<word(TESTHOST_CALL*)(word, word, word, word, word, word)>(function)(
                 a[0], a[1], a[2], a[3], a[4], a[5]);
@@ -223,8 +229,12 @@ word Library::call_export(const char* name, std::initializer_list<word> args) co
     return call(function, args);
 }
 
-std::size_t Library::stack_errors() { return g_stack_errors; }
-void Library::reset_stack_errors() { g_stack_errors = 0; }
+std::size_t Library::stack_errors() {
+    return g_stack_errors;
+}
+void Library::reset_stack_errors() {
+    g_stack_errors = 0;
+}
 
 // ---------------------------------------------------------------- Param
 
@@ -249,7 +259,9 @@ Param Param::of(std::string v) {
     return p;
 }
 
-Param Param::of(const char* v) { return v == nullptr ? null() : of(std::string(v)); }
+Param Param::of(const char* v) {
+    return v == nullptr ? null() : of(std::string(v));
+}
 
 Param Param::null() {
     Param p;
@@ -321,22 +333,36 @@ void Instance::set_result_flags(std::uint16_t flags) {
     std::memcpy(record_.data() + RecordLayout::kResultFlags, &flags, sizeof flags);
 }
 
-std::int32_t Instance::count(int collection) const { return i32(count_offset(collection)); }
-word Instance::root(int collection) const { return pointer(root_offset(collection)); }
-word Instance::index(int collection) const { return pointer(index_offset(collection)); }
+std::int32_t Instance::count(int collection) const {
+    return i32(count_offset(collection));
+}
+word Instance::root(int collection) const {
+    return pointer(root_offset(collection));
+}
+word Instance::index(int collection) const {
+    return pointer(index_offset(collection));
+}
 
 // ---------------------------------------------------------------- NodeView
 
-std::int32_t NodeView::integer() const { return read_address<std::int32_t>(address); }
-float NodeView::floating() const { return read_address<float>(address); }
+std::int32_t NodeView::integer() const {
+    return read_address<std::int32_t>(address);
+}
+float NodeView::floating() const {
+    return read_address<float>(address);
+}
 
 std::string NodeView::string() const {
     const auto* text = read_address<const char*>(address);
     return text == nullptr ? std::string() : std::string(text);
 }
 
-NodeView NodeView::left() const { return NodeView{read_address<word>(address + RecordLayout::kNodeLeft)}; }
-NodeView NodeView::right() const { return NodeView{read_address<word>(address + RecordLayout::kNodeRight)}; }
+NodeView NodeView::left() const {
+    return NodeView{read_address<word>(address + RecordLayout::kNodeLeft)};
+}
+NodeView NodeView::right() const {
+    return NodeView{read_address<word>(address + RecordLayout::kNodeRight)};
+}
 
 // ---------------------------------------------------------------- host routines
 
@@ -371,7 +397,7 @@ struct Routines {
             ++h.missing_params_;
             return 0;
         }
-        const Param p = std::move(h.params_.front());
+        Param p = std::move(h.params_.front());
         h.params_.pop_front();
         if (p.kind == Param::Kind::raw) {
             return p.raw;
@@ -500,7 +526,9 @@ constexpr std::size_t kHeaderWords = 320;
 constexpr std::size_t kServiceWords = 96;
 }  // namespace
 
-Host* Host::active() { return g_active; }
+Host* Host::active() {
+    return g_active;
+}
 
 Host::Host(std::shared_ptr<Library> library) : library_(std::move(library)) {
     if (!library_) {
@@ -516,7 +544,6 @@ Host::Host(std::shared_ptr<Library> library) : library_(std::move(library)) {
     services_[RecordLayout::kOpenFile] = routine_word(&Routines::open_file);
     services_[RecordLayout::kCloseFile] = routine_word(&Routines::close_file);
 
-    previous_active_ = g_active;
     g_active = this;
     if (library_->loader_owned()) {
         read_infos();  // the loader made the process attach call at load
@@ -527,13 +554,16 @@ Host::Host(std::shared_ptr<Library> library) : library_(std::move(library)) {
 }
 
 Host::~Host() {
-    g_active = this;
     for (auto& instance : instances_) {
         if (!instance->destroyed_) {
             destroy(*instance);
         }
     }
-    g_active = previous_active_;
+    // Every call into the library makes its host the active one, so a host
+    // that goes only has to stop being found.
+    if (g_active == this) {
+        g_active = nullptr;
+    }
 }
 
 word Host::dll_main(word reason) {
@@ -551,8 +581,7 @@ word Host::dll_main(word reason) {
 
 word Host::read_infos(unsigned char fill) {
     info_block_.assign(RecordLayout::kInfoSize + 32, fill);
-    const word result =
-        library_->call_export("GetRunObjectInfos", {0, reinterpret_cast<word>(info_block_.data())});
+    const word result = library_->call_export("GetRunObjectInfos", {0, reinterpret_cast<word>(info_block_.data())});
     const unsigned char* b = info_block_.data();
     tables_.conditions = read_at<word>(b, RecordLayout::kInfoConditions);
     tables_.actions = read_at<word>(b, RecordLayout::kInfoActions);
@@ -604,11 +633,9 @@ Instance& Host::create(std::int32_t case_sensitive, std::int32_t use_indices, st
 
     instances_.push_back(std::move(instance));
     Instance& created = *instances_.back();
-    Host* const previous = g_active;
     g_active = this;
-    created.create_result_ = library_->call_export("CreateRunObject",
-                          {created.address(), reinterpret_cast<word>(edit), reinterpret_cast<word>(creation)});
-    g_active = previous;
+    created.create_result_ = library_->call_export(
+        "CreateRunObject", {created.address(), reinterpret_cast<word>(edit), reinterpret_cast<word>(creation)});
     return created;
 }
 
@@ -616,10 +643,8 @@ void Host::destroy(Instance& instance, word second) {
     if (instance.destroyed_) {
         throw std::logic_error("instance destroyed twice");
     }
-    Host* const previous = g_active;
     g_active = this;
     instance.destroy_result_ = library_->call_export("DestroyRunObject", {instance.address(), second});
-    g_active = previous;
     instance.destroyed_ = true;
 }
 
@@ -630,10 +655,8 @@ word Host::call_handler(word handler, Instance& instance, std::initializer_list<
     if (instance.destroyed_) {
         throw std::logic_error("handler called on a destroyed instance");
     }
-    Host* const previous = g_active;
     g_active = this;
     const word result = library_->call(reinterpret_cast<void*>(handler), args);
-    g_active = previous;
     held_strings_.clear();  // parameter strings live only while the handler runs
     return result;
 }

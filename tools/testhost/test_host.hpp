@@ -84,7 +84,7 @@ public:
     Library(const Library&) = delete;
     Library& operator=(const Library&) = delete;
 
-    void* symbol(const char* name) const;  // null when absent
+    void* symbol(const char* name) const;        // null when absent
     void* symbol_by_ordinal(int ordinal) const;  // Windows only; null elsewhere
     word module_handle() const;
 
@@ -134,8 +134,14 @@ struct Param {
 
 // One call of a host routine by the library.
 struct HostCall {
-    enum class Routine { read_event_param, read_first_expr_param, read_next_expr_param, alloc_result_string,
-                         open_file, close_file };
+    enum class Routine {
+        read_event_param,
+        read_first_expr_param,
+        read_next_expr_param,
+        alloc_result_string,
+        open_file,
+        close_file
+    };
     Routine routine;
     std::vector<word> args;
     word result = 0;  // what the host gave back
@@ -263,8 +269,8 @@ private:
 
     std::shared_ptr<Library> library_;
     Tables tables_;
-    std::vector<word> header_;   // HostRunHeader: a table of words
-    std::vector<word> services_; // HostServiceTable
+    std::vector<word> header_;    // HostRunHeader: a table of words
+    std::vector<word> services_;  // HostServiceTable
     std::vector<std::unique_ptr<Instance>> instances_;
     std::deque<Param> params_;
     std::vector<HostCall> calls_;
@@ -281,7 +287,6 @@ private:
     std::size_t bad_closes_ = 0;
     std::uint32_t overstated_by_ = 0;
     std::set<word> open_files_;
-    Host* previous_active_ = nullptr;
 };
 
 // The runtime generator the library draws from. On ELF targets this program
