@@ -46,6 +46,8 @@ constexpr std::size_t kMaxFileBytes = 160;
 constexpr std::size_t kMaxManyLines = 700;
 constexpr std::size_t kPoolSize = 48;
 constexpr std::size_t kHistory = 40;
+constexpr std::size_t kSweepFull = 64;  // larger collections are sampled
+constexpr std::size_t kMaxSweeps = 8;   // per input, besides the final one
 
 constexpr std::uint16_t kFloatFlag = 0x4000;
 constexpr std::uint16_t kStringFlag = 0x8000;
@@ -998,28 +1000,44 @@ private:
         expression(s, number, integer_param, float_bits, text, word_value, script);
     }
 
-    // Every position of every index, one past each end, and the position of
-    // every held value, all through the expressions.
+    // The positions of each index, one before and one past each end, and
+    // the position of each held value, all through the expressions. Large
+    // collections are sampled with a stride (whose phase moves from sweep to
+    // sweep), so a sweep costs a few hundred handler calls at most.
     void sweep(Subject& s) {
         const fuzzmodel::Instance& m = *s.model;
-        for (std::int32_t p = -1; p <= m.integers_size(); ++p) {
-            expression(s, 7, p, std::nullopt, std::nullopt, p, {});
-        }
-        for (std::int32_t p = -1; p <= m.floats_size(); ++p) {
-            expression(s, 9, p, std::nullopt, std::nullopt, p, {});
-        }
-        for (std::int32_t p = -1; p <= m.strings_size(); ++p) {
-            expression(s, 11, p, std::nullopt, std::nullopt, p, {});
-        }
-        for (const int slot : m.integers().index) {
-            expression(s, 6, m.integers().at(slot).value, std::nullopt, std::nullopt, 0, {});
-        }
-        for (const int slot : m.floats().index) {
-            expression(s, 8, std::nullopt, std::bit_cast<std::uint32_t>(m.floats().at(slot).value), std::nullopt, 0, {});
-        }
-        for (const int slot : m.strings().index) {
-            expression(s, 10, std::nullopt, std::nullopt, Text(m.strings().at(slot).value), 0, {});
-        }
+        ++sweeps_;
+        const auto positions = [this](std::int32_t count, const auto& at) {
+            const std::size_t n = static_cast<std::size_t>(count);
+            const std::size_t step = n <= kSweepFull ? 1 : (n + kSweepFull - 1) / kSweepFull;
+            at(-1);
+            for (std::size_t p = step == 1 ? 0 : sweeps_ % step; p < n; p += step) {
+                at(static_cast<std::int32_t>(p));
+            }
+            if (n > 0) {
+                at(count - 1);
+            }
+            at(count);
+        };
+        positions(m.integers_size(), [&](std::int32_t p) { expression(s, 7, p, std::nullopt, std::nullopt, p, {}); });
+        positions(m.floats_size(), [&](std::int32_t p) { expression(s, 9, p, std::nullopt, std::nullopt, p, {}); });
+        positions(m.strings_size(), [&](std::int32_t p) { expression(s, 11, p, std::nullopt, std::nullopt, p, {}); });
+        const auto held = [this](std::size_t n, const auto& at) {
+            const std::size_t step = n <= kSweepFull ? 1 : (n + kSweepFull - 1) / kSweepFull;
+            for (std::size_t i = step == 1 ? 0 : sweeps_ % step; i < n; i += step) {
+                at(i);
+            }
+        };
+        held(m.integers().index.size(), [&](std::size_t i) {
+            expression(s, 6, m.integers().at(m.integers().index[i]).value, std::nullopt, std::nullopt, 0, {});
+        });
+        held(m.floats().index.size(), [&](std::size_t i) {
+            const float v = m.floats().at(m.floats().index[i]).value;
+            expression(s, 8, std::nullopt, std::bit_cast<std::uint32_t>(v), std::nullopt, 0, {});
+        });
+        held(m.strings().index.size(), [&](std::size_t i) {
+            expression(s, 10, std::nullopt, std::nullopt, Text(m.strings().at(m.strings().index[i]).value), 0, {});
+        });
     }
 
     void one_event() {
@@ -1032,13 +1050,13 @@ private:
             action(s, kind - 3);
         } else if (kind < 25) {
             expression_event(s, kind - 13);
-        } else if (kind == 25) {
+        } else if (kind == 25 && sweeps_ < kMaxSweeps) {
             sweep(s);
         } else if (kind == 26) {
             begin("DestroyRunObject, then a new instance in its place", s);
             host_.destroy(*s.host);
             create(s, s.number);
-        } else if (kind == 27) {
+        } else if (kind == 25 || kind == 27) {
             for (Subject& each : subjects_) {
                 for (int c = 0; c < 3; ++c) {
                     compare_tree(each, c);
@@ -1066,6 +1084,7 @@ private:
     std::vector<Subject> subjects_;
     std::size_t event_number_ = 0;
     std::size_t handler_calls_ = 0;
+    std::size_t sweeps_ = 0;
 };
 
 }  // namespace

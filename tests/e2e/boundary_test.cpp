@@ -882,6 +882,10 @@ TEST(StackCheck, CatchesACalleeThatRemovesTheWrongBytes) {
 #endif
 }
 
+TEST(TestHost, ALibraryThatIsNotThereDoesNotLoad) {
+    EXPECT_THROW(Library::load("sorvel-no-such-library"), std::runtime_error);
+}
+
 TEST_F(HostTest, DrawsAreCountedThroughTheRuntimeGenerator) {
     Instance& instance = host.create(0, 0);
     draws::reseed(17, 8);

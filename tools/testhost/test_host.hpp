@@ -94,9 +94,9 @@ public:
     void* entry_point() const;
     bool loader_owned() const { return loader_owned_; }
 
-    // Calls a function of the library with the given words. On i386 the call
-    // checks that the callee removed exactly its arguments (stdcall); every
-    // mismatch is counted in stack_errors().
+    // Calls a function of the library with the given words. On 32-bit x86
+    // ELF the call checks that the callee removed exactly its arguments
+    // (stdcall); every mismatch is counted in stack_errors().
     word call(void* function, std::initializer_list<word> args) const;
     word call_export(const char* name, std::initializer_list<word> args) const;
     static std::size_t stack_errors();
