@@ -1,5 +1,6 @@
 #include "collections/collections.hpp"
 
+#include <array>
 #include <cmath>
 #include <new>
 
@@ -91,6 +92,15 @@ TreeNode<V>* make_number_node(V value) noexcept {
     return node;
 }
 
+// 'A'..'Z' folded to 'a'..'z', every other byte as it is.
+constexpr auto kFolded = [] {
+    std::array<unsigned char, 256> table{};
+    for (unsigned c = 0; c < 256; ++c) {
+        table[c] = static_cast<unsigned char>(c - 'A' < 26U ? c + 32U : c);
+    }
+    return table;
+}();
+
 }  // namespace
 
 int CompareStrings(const char* a, const char* b, bool case_sensitive) noexcept {
@@ -107,15 +117,17 @@ int CompareStrings(const char* a, const char* b, bool case_sensitive) noexcept {
         }
     }
     for (;; ++x, ++y) {
-        unsigned p = *x;
-        unsigned q = *y;
-        p += (p - 'A' < 26U) ? 32U : 0U;
-        q += (q - 'A' < 26U) ? 32U : 0U;
+        if (*x == *y) {
+            if (*x == 0) {
+                return 0;
+            }
+            continue;
+        }
+        // Only a difference needs folding: equal bytes stay equal.
+        const unsigned p = kFolded[*x];
+        const unsigned q = kFolded[*y];
         if (p != q) {
             return p < q ? -1 : 1;
-        }
-        if (p == 0) {
-            return 0;
         }
     }
 }

@@ -278,7 +278,7 @@ TEST_F(Collections, DeepChainsAreFreedOnASmallStack) {
                 ASSERT_EQ(i.count(c), kDepth);
             }
             const auto before = host.calls().size();
-            sorvel::testing::run_on_small_stack([&] {
+            const bool finished = sorvel::testing::run_on_small_stack([&] {
                 if (destroy) {
                     host.destroy(i);
                 } else {
@@ -287,6 +287,7 @@ TEST_F(Collections, DeepChainsAreFreedOnASmallStack) {
                     host.event(i, "Clear Strings");
                 }
             });
+            EXPECT_TRUE(finished);
             EXPECT_EQ(host.calls().size(), before);
             if (!destroy) {
                 for (int c = 0; c < 3; ++c) {
