@@ -17,6 +17,7 @@
 #include <malloc.h>
 #endif
 
+#include "bench_fields.hpp"
 #include "collections/collections.hpp"
 
 namespace {
@@ -60,27 +61,7 @@ std::vector<T> shuffled(const std::vector<T>& values, std::uint32_t seed) {
     return out;
 }
 
-// A collection's fields, owned here, as the run record owns them.
-template <class V>
-struct Fields {
-    TreeNode<V>* root = nullptr;
-    std::int32_t count = 0;
-    InsertionIndex<TreeNode<V>>* index = nullptr;
-
-    explicit Fields(bool with_index = false) {
-        if (with_index) {
-            index = create_index<TreeNode<V>>();
-        }
-    }
-    Fields(const Fields&) = delete;
-    Fields& operator=(const Fields&) = delete;
-    ~Fields() {
-        Collection<V> c = view();
-        clear(c);
-        destroy_index(index);
-    }
-    Collection<V> view() { return Collection<V>{root, count, index}; }
-};
+using bench::Fields;
 
 void fill(Fields<std::int32_t>& f, const std::vector<std::int32_t>& values) {
     IntegerCollection c = f.view();

@@ -9,6 +9,7 @@
 #include <string>
 #include <vector>
 
+#include "bench_fields.hpp"
 #include "collections/collections.hpp"
 #include "collections/random_path.hpp"
 
@@ -19,26 +20,7 @@ using namespace sorvel;
 constexpr std::size_t kValues = 100'000;
 constexpr std::int32_t kChain = 20'000;
 
-template <class V>
-struct Fields {
-    TreeNode<V>* root = nullptr;
-    std::int32_t count = 0;
-    InsertionIndex<TreeNode<V>>* index = nullptr;
-
-    explicit Fields(bool with_index) {
-        if (with_index) {
-            index = create_index<TreeNode<V>>();
-        }
-    }
-    Fields(const Fields&) = delete;
-    Fields& operator=(const Fields&) = delete;
-    ~Fields() {
-        Collection<V> c = view();
-        clear(c);
-        destroy_index(index);
-    }
-    Collection<V> view() { return Collection<V>{root, count, index}; }
-};
+using bench::Fields;
 
 struct Data {
     std::vector<std::int32_t> integers;
