@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
 # Builds all five targets and runs every test that can run here:
 # native (sanitizers), i386 (qemu), windows-x64 (wine), the product DLL's
-# static checks, and the valgrind run of the optimised build.
+# static checks, the valgrind run of the optimised build, and the
+# differential fuzzer (clang, libFuzzer) over its corpus and for about a minute.
 set -euo pipefail
 cd "$(dirname "$0")/.."
 bash scripts/setup.sh
@@ -28,3 +29,5 @@ build windows-x64
 stage "test windows-x64" 1200 ctest --preset windows-x64
 build native-plain
 stage "test native-plain" 1200 ctest --preset native-plain
+build fuzz
+stage "test fuzz (corpus, then about 60 s of fuzzing)" 600 ctest --preset fuzz
