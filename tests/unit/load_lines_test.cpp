@@ -281,37 +281,6 @@ TEST(LoadLinesSplitting, WorksWithoutAnIndex) {
     EXPECT_EQ(sorvel::memory::live_allocations(), baseline);
 }
 
-TEST(LoadLinesPlain, LinesJoinWhatIsAlreadyHeld) {
-    const std::size_t baseline = sorvel::memory::live_allocations();
-    {
-        Strings strings;
-        sorvel::StringCollection view = strings.view();
-        ASSERT_TRUE(sorvel::AddStringValue(view, "m", false));
-        ASSERT_TRUE(sorvel::AddStringValue(view, "z", false));
-        ScriptedDraws draws;
-        load(strings, "b\nM\na\n", false, false, draws);
-        EXPECT_EQ(strings.in_index_order(), (std::vector<std::string>{"m", "z", "b", "a"}));
-        EXPECT_EQ(strings.count, 4);
-        EXPECT_TRUE(consistent(strings, false));
-    }
-    EXPECT_EQ(sorvel::memory::live_allocations(), baseline);
-}
-
-TEST(LoadLinesPlain, LoadingTheSameFileTwiceAddsNothingNew) {
-    const std::size_t baseline = sorvel::memory::live_allocations();
-    for (const bool balanced : {false, true}) {
-        Strings strings;
-        ScriptedDraws draws;
-        load(strings, "one\r\ntwo\r\nthree", true, balanced, draws);
-        const std::vector<std::string> first = strings.in_index_order();
-        load(strings, "one\r\ntwo\r\nthree", true, balanced, draws);
-        EXPECT_EQ(strings.in_index_order(), first);
-        EXPECT_EQ(strings.count, 3);
-        EXPECT_EQ(draws.calls, balanced ? 6U : 0U);
-    }
-    EXPECT_EQ(sorvel::memory::live_allocations(), baseline);
-}
-
 TEST(LoadLinesPlain, SortedLinesBuildAChainThatFreesCleanly) {
     const std::size_t baseline = sorvel::memory::live_allocations();
     {
