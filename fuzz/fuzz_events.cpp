@@ -1,10 +1,18 @@
 // Differential fuzzer: decodes its input into events for one to three object
 // instances, runs them through the library's real handler tables by way of
-// the test host, and after every event holds the library against the
-// reference model in model.hpp: results, counts, result flags, host calls,
-// draws, tree shapes and (on request and at the end) insertion order.
-// Any difference aborts with a description of the event and its history, and
-// libFuzzer keeps the input that caused it.
+// the test host (the library linked in, so libFuzzer sees its coverage, and
+// the test host's own rand, so every draw is scripted and counted), and after
+// every event holds the library against the reference model in model.hpp:
+// results, counts, result flags, host calls and their arguments, draws, the
+// header bytes the library may not touch, tree shapes and (in sweeps and at
+// the end) insertion order. Any difference aborts with a description of the
+// event and the ones before it, and libFuzzer keeps the input.
+//
+// Input: one byte for the number of instances, then per instance a byte of
+// option words and two bytes of a creation word; then events, one byte each
+// (low 5 bits the kind, high 3 bits the instance) followed by the bytes their
+// values take. Past its end the input reads as zeros. SORVEL_FUZZ_TRACE=1
+// prints the events of an input as they run.
 #include <unistd.h>
 
 #include <array>
@@ -43,11 +51,14 @@ using Text = fuzzmodel::Instance::Text;
 // Bounds that keep one execution in the millisecond range.
 constexpr std::size_t kMaxEvents = 256;
 constexpr std::size_t kMaxFileBytes = 160;
+constexpr std::size_t kMinManyLines = 60;
 constexpr std::size_t kMaxManyLines = 700;
+constexpr std::size_t kManyLinesPerInput = 2000;
 constexpr std::size_t kPoolSize = 48;
 constexpr std::size_t kHistory = 40;
 constexpr std::size_t kSweepFull = 64;  // larger collections are sampled
 constexpr std::size_t kMaxSweeps = 8;   // per input, besides the final one
+constexpr std::size_t kMaxFailingLoadLines = 100;
 
 constexpr std::uint16_t kFloatFlag = 0x4000;
 constexpr std::uint16_t kStringFlag = 0x8000;
@@ -130,6 +141,7 @@ public:
     Input(const std::uint8_t* data, std::size_t size) : data_(data), size_(size) {}
     bool exhausted() const { return at_ >= size_; }
     std::uint8_t byte() { return at_ < size_ ? data_[at_++] : 0; }
+    int small() { return static_cast<int>(byte()) - 128; }  // -128 to 127
     std::uint16_t u16() { return static_cast<std::uint16_t>(byte() | (byte() << 8)); }
     std::uint32_t u32() {
         const std::uint32_t low = u16();
@@ -167,19 +179,27 @@ public:
     explicit Values(Input& in) : in_(in) {}
 
     std::int32_t integer() {
-        static constexpr std::array<std::int32_t, 12> kSpecial = {
-            std::numeric_limits<std::int32_t>::min(), std::numeric_limits<std::int32_t>::max(), 0, -1, 1,
-            std::numeric_limits<std::int32_t>::min() + 1, std::numeric_limits<std::int32_t>::max() - 1,
-            65535, 65536, -65536, 32767, 32768};
+        static constexpr std::array<std::int32_t, 12> kEdges = {std::numeric_limits<std::int32_t>::min(),
+                                                                std::numeric_limits<std::int32_t>::max(),
+                                                                0,
+                                                                -1,
+                                                                1,
+                                                                std::numeric_limits<std::int32_t>::min() + 1,
+                                                                std::numeric_limits<std::int32_t>::max() - 1,
+                                                                65535,
+                                                                65536,
+                                                                -65536,
+                                                                32767,
+                                                                32768};
         std::int32_t v = 0;
         const std::uint8_t b = in_.byte();
         switch (b % 8) {
             case 0:
-            case 1: v = static_cast<std::int8_t>(in_.byte()); break;
-            case 2: v = kSpecial[in_.byte() % kSpecial.size()]; break;
+            case 1: v = in_.small(); break;
+            case 2: v = kEdges[in_.byte() % kEdges.size()]; break;
             case 3: v = static_cast<std::int32_t>(in_.u32()); break;
             case 7: v = in_.byte() % 8; break;
-            default: v = ints_.empty() ? static_cast<std::int8_t>(in_.byte()) : ints_.pick(in_.byte()); break;
+            default: v = ints_.empty() ? in_.small() : ints_.pick(in_.byte()); break;
         }
         ints_.put(v);
         return v;
@@ -187,7 +207,7 @@ public:
 
     // The 32 bits of a float, NaNs with any payload included.
     std::uint32_t float_bits() {
-        static constexpr std::array<std::uint32_t, 20> kSpecial = {
+        static constexpr std::array<std::uint32_t, 20> kEdges = {
             0x00000000, 0x80000000,              // +0.0, -0.0
             0x7F800000, 0xFF800000,              // +inf, -inf
             0x7FC00000, 0xFFC00000, 0x7F800001,  // quiet NaNs, a signalling NaN
@@ -200,8 +220,8 @@ public:
         std::uint32_t bits = 0;
         const std::uint8_t b = in_.byte();
         switch (b % 10) {
-            case 0: bits = std::bit_cast<std::uint32_t>(static_cast<float>(static_cast<std::int8_t>(in_.byte()))); break;
-            case 1: bits = kSpecial[in_.byte() % kSpecial.size()]; break;
+            case 0: bits = std::bit_cast<std::uint32_t>(static_cast<float>(in_.small())); break;
+            case 1: bits = kEdges[in_.byte() % kEdges.size()]; break;
             case 2: {  // NaN: all-ones exponent, non-zero payload, either sign
                 const std::uint32_t raw = in_.u32();
                 bits = (raw & 0x80000000U) | 0x7F800000U | (raw & 0x007FFFFFU) | ((raw & 0x007FFFFFU) == 0 ? 1U : 0U);
@@ -216,9 +236,7 @@ public:
             case 8:  // a neighbouring bit pattern of a value met before
                 bits = floats_.empty() ? 0U : floats_.pick(in_.byte()) + ((b & 0x10) != 0 ? 1U : 0xFFFFFFFFU);
                 break;
-            case 9:
-                bits = std::bit_cast<std::uint32_t>(static_cast<float>(static_cast<std::int8_t>(in_.byte())) / 4.0F);
-                break;
+            case 9: bits = std::bit_cast<std::uint32_t>(static_cast<float>(in_.small()) / 4.0F); break;
             default: bits = floats_.empty() ? 0U : floats_.pick(in_.byte()); break;
         }
         floats_.put(bits);
@@ -291,29 +309,34 @@ public:
 
     // A position for the value-at-position expressions.
     std::int32_t position(std::int32_t count) {
-        static constexpr std::array<std::int32_t, 8> kSpecial = {
-            std::numeric_limits<std::int32_t>::min(), std::numeric_limits<std::int32_t>::max(), -1, -65536, 65536,
-            65537, -2, 0x10000 - 1};
+        static constexpr std::array<std::int32_t, 8> kEdges = {std::numeric_limits<std::int32_t>::min(),
+                                                               std::numeric_limits<std::int32_t>::max(),
+                                                               -1,
+                                                               -65536,
+                                                               65536,
+                                                               65537,
+                                                               -2,
+                                                               0x10000 - 1};
         const std::uint8_t b = in_.byte();
         switch (b % 4) {
             case 0:
             case 1: return static_cast<std::int32_t>(in_.byte() % (static_cast<unsigned>(count) + 3U)) - 1;
-            case 2: return kSpecial[in_.byte() % kSpecial.size()];
+            case 2: return kEdges[in_.byte() % kEdges.size()];
             default: return integer();
         }
     }
 
     // The second argument of an expression handler: any 32-bit value.
     std::int32_t param_word() {
-        static constexpr std::array<std::uint32_t, 10> kSpecial = {
-            0x00010001, 0x0000FFFF, 0x00008000, 0x00007FFF, 0xFFFF8000,
-            0x80000000, 0x12345678, 0xFFFFFFFF, 0x00010000, 0x7FFFFFFF};
+        static constexpr std::array<std::uint32_t, 10> kEdges = {0x00010001, 0x0000FFFF, 0x00008000, 0x00007FFF,
+                                                                 0xFFFF8000, 0x80000000, 0x12345678, 0xFFFFFFFF,
+                                                                 0x00010000, 0x7FFFFFFF};
         const std::uint8_t b = in_.byte();
         switch (b % 4) {
             case 0: return 0;
             case 1: return static_cast<std::int32_t>(in_.u32());
-            case 2: return static_cast<std::int32_t>(kSpecial[in_.byte() % kSpecial.size()]);
-            default: return static_cast<std::int8_t>(in_.byte());
+            case 2: return static_cast<std::int32_t>(kEdges[in_.byte() % kEdges.size()]);
+            default: return in_.small();
         }
     }
 
@@ -321,7 +344,7 @@ public:
     // every way, with blank lines, zero bytes and stray bytes between them.
     std::string file() {
         const std::uint8_t shape = in_.byte();
-        if (shape >= 224) {
+        if (shape >= 224 && many_lines_left_ >= kMinManyLines) {
             return many_lines();
         }
         const std::size_t target = shape % kMaxFileBytes;
@@ -348,7 +371,10 @@ public:
     // pick from: numbers below a modulus (small ones repeat), optionally
     // with letters in either case, zero bytes and blank lines, or sorted.
     std::string many_lines() {
-        const std::size_t lines = 60 + in_.u16() % (kMaxManyLines - 59);
+        // A budget per input keeps an input of many big loads fast.
+        std::size_t lines = kMinManyLines + in_.u16() % (kMaxManyLines - kMinManyLines + 1);
+        lines = lines < many_lines_left_ ? lines : many_lines_left_;
+        many_lines_left_ -= lines;
         const std::uint32_t modulus = 1U + in_.u16();
         const std::uint8_t style = in_.byte();
         std::uint64_t state = in_.u32();
@@ -409,6 +435,7 @@ private:
     }
 
     Input& in_;
+    std::size_t many_lines_left_ = kManyLinesPerInput;
     Pool<std::int32_t> ints_;
     Pool<std::uint32_t> floats_;
     Pool<std::string> strings_;
@@ -418,20 +445,15 @@ private:
 
 // One file per process, so parallel fuzzing jobs do not share it.
 const std::string& file_path() {
-    static const std::string path = [] {
-        const std::string p =
-            (std::filesystem::temp_directory_path() / ("sorvel-fuzz-" + std::to_string(::getpid()) + ".txt")).string();
-        std::atexit([] { std::remove(file_path().c_str()); });
-        return p;
-    }();
+    static const std::string path =
+        (std::filesystem::temp_directory_path() / ("sorvel-fuzz-" + std::to_string(::getpid()) + ".txt")).string();
     return path;
 }
 
 const std::string& missing_path() {
-    static const std::string path =
-        (std::filesystem::temp_directory_path() / ("sorvel-fuzz-" + std::to_string(::getpid()) + "-missing") /
-         "none.txt")
-            .string();
+    static const std::string path = (std::filesystem::temp_directory_path() /
+                                     ("sorvel-fuzz-" + std::to_string(::getpid()) + "-missing") / "none.txt")
+                                        .string();
     return path;
 }
 
@@ -460,7 +482,9 @@ Param float_param(std::uint32_t bits) {
     return Param::raw_word(static_cast<word>(static_cast<std::uintptr_t>(bits)));
 }
 
-Param text_param(const Text& t) { return t ? Param::of(*t) : Param::null(); }
+Param text_param(const Text& t) {
+    return t ? Param::of(*t) : Param::null();
+}
 
 // What one host routine call must look like; an argument of nullopt is not
 // checked (pointers the library takes from the host).
@@ -506,6 +530,8 @@ public:
             begin("DestroyRunObject", s);
             host_.destroy(*s.host);
         }
+        // Every node, string, index and reader the instances had is freed.
+        expect_equal(sorvel::memory::live_allocations(), live_at_start_, "library allocations still live");
     }
 
 private:
@@ -675,8 +701,7 @@ private:
         switch (collection) {
             case kIntegers:
                 walk(
-                    s.host->root(kIntegers), m.integers(),
-                    [](NodeView n, std::int32_t v) { return n.integer() == v; },
+                    s.host->root(kIntegers), m.integers(), [](NodeView n, std::int32_t v) { return n.integer() == v; },
                     [](std::int32_t v) { return std::to_string(v); }, "integer");
                 break;
             case kFloats:
@@ -689,7 +714,8 @@ private:
                 break;
             default:
                 walk(
-                    s.host->root(kStrings), m.strings(), [](NodeView n, const std::string& v) { return n.string() == v; },
+                    s.host->root(kStrings), m.strings(),
+                    [](NodeView n, const std::string& v) { return n.string() == v; },
                     [](const std::string& v) { return show(v); }, "string");
                 break;
         }
@@ -703,7 +729,8 @@ private:
 
     ExpectedCall expr_param(const Subject& s, word type, std::int32_t param_word) {
         // Only the low 16 bits of the parameter word reach the host, sign-extended.
-        const auto arrives = static_cast<word>(static_cast<std::int16_t>(static_cast<std::uint16_t>(param_word & 0xFFFF)));
+        const auto arrives =
+            static_cast<word>(static_cast<std::int16_t>(static_cast<std::uint16_t>(param_word & 0xFFFF)));
         return {Routine::read_first_expr_param, {s.host->address(), type, arrives}};
     }
 
@@ -764,6 +791,12 @@ private:
         int touched = kIntegers;
         fuzzmodel::Draws model_draws({});
         std::optional<bool> opens;  // for Load From File: whether the file opens
+        struct LoadArguments {
+            std::optional<std::string> contents;
+            std::int32_t balance;
+            std::size_t lines;
+        };
+        std::optional<LoadArguments> load;
         switch (number) {
             case 0:
             case 1: {
@@ -843,10 +876,14 @@ private:
                 script = values_.draws(balance != 0 ? lines : 0);
                 model_draws = fuzzmodel::Draws(script);
                 s.model->load(contents, balance, model_draws);
+                if (lines > kMaxFailingLoadLines) {
+                    failing_allocation = -1;  // each outcome is a model run: keep them few
+                    before.reset();
+                }
+                load = LoadArguments{contents, balance, lines};
                 what = "Load From File " +
                        (contents ? "file of " + std::to_string(contents->size()) + " bytes, " + std::to_string(lines) +
-                                       " lines: " + show(contents->substr(0, 96)) +
-                                       (contents->size() > 96 ? "..." : "")
+                                       " lines: " + show(contents->substr(0, 96)) + (contents->size() > 96 ? "..." : "")
                                  : show(name)) +
                        " balance " + std::to_string(balance);
                 params = {text_param(name), Param::of(balance)};
@@ -868,18 +905,18 @@ private:
         sorvel::memory::fail_allocation_after(failing_allocation);
         const word got = host_.action(*s.host, number, std::move(params));
         sorvel::memory::fail_allocation_after(-1);
+        if (opens.value_or(false)) {
+            // libFuzzer may end the process without running exit handlers.
+            std::remove(file_path().c_str());
+        }
         expect_equal(got, word{0}, "action result");
         check_calls(calls);
-        if (before && s.host->count(touched) == count_of(*before, touched)) {
-            // The library promises all or nothing when memory runs out: an
-            // add that did not happen must have left everything as it was.
-            *s.model = *before;
-        }
         if (opens) {
             const std::vector<HostCall>& made = host_.calls();
             const word handle = made[2].result;
             if ((handle != -1) != *opens) {
-                mismatch("HostOpenFile gave " + std::to_string(handle) + " for " + (*opens ? "the file" : "a missing file"));
+                mismatch("HostOpenFile gave " + std::to_string(handle) + " for " +
+                         (*opens ? "the file" : "a missing file"));
             }
             if (*opens && made[3].args[0] != handle) {
                 mismatch("HostCloseFile got " + std::to_string(made[3].args[0]) + ", not the handle " +
@@ -890,7 +927,122 @@ private:
                 mismatch("HostOpenFile got another pointer than the name the host gave");
             }
         }
-        finish(s, flags, 0, model_draws.used(), touched);
+        // After the checks of the calls: reading the index back makes calls of its own.
+        std::size_t draws_used = model_draws.used();
+        if (before && load) {
+            draws_used =
+                outcome_of_failing_load(s, *before, load->contents, load->balance, load->lines, script, draws_used);
+        } else if (before && s.host->count(touched) == count_of(*before, touched)) {
+            // The library promises all or nothing when memory runs out: an
+            // add that did not happen must have left everything as it was.
+            *s.model = *before;
+        }
+        finish(s, flags, 0, draws_used, touched);
+    }
+
+    // A load during which one allocation failed may, by the library's own
+    // promise, end in one of these ways: as if nothing failed, as if the
+    // load did nothing at all (the file buffer or the balanced bookkeeping
+    // could not be had: nothing added, nothing drawn), or with exactly one
+    // line's add left out and everything else done. The model takes the
+    // outcome whose strings, shape and draws are the library's; none
+    // matching is a mismatch. Gives the number of draws of that outcome.
+    std::size_t outcome_of_failing_load(Subject& s, const fuzzmodel::Instance& before,
+                                        const std::optional<std::string>& contents, std::int32_t balance,
+                                        std::size_t lines, const std::vector<int>& script, std::size_t full_draws) {
+        const std::size_t made = draws::made();
+        // Tree and index both: two outcomes can differ in the order of
+        // additions alone, which leaves the same tree when the lines do not
+        // meet on their way down.
+        const std::string library = library_strings(s.host->root(kStrings)) + '|' + library_index(s);
+        const auto matches = [&](const fuzzmodel::Instance& m, std::size_t used) {
+            return used == made && m.strings_size() == s.host->count(kStrings) &&
+                   model_strings(m) + '|' + model_index(m) == library;
+        };
+        if (matches(*s.model, full_draws)) {
+            return full_draws;
+        }
+        if (matches(before, 0)) {
+            *s.model = before;
+            return 0;
+        }
+        for (std::size_t left_out = 0; left_out < lines; ++left_out) {
+            fuzzmodel::Instance candidate = before;
+            fuzzmodel::Draws d(script);
+            candidate.load(contents, balance, d, left_out);
+            if (matches(candidate, d.used())) {
+                *s.model = std::move(candidate);
+                return d.used();
+            }
+        }
+        mismatch(
+            "the strings after a load with a failing allocation match no outcome: neither the full load, "
+            "nor none, nor one line left out (library drew " +
+            std::to_string(made) + " times, holds " + std::to_string(s.host->count(kStrings)) + " strings)");
+    }
+
+    // Preorder with empty links marked, each string with its length: equal
+    // texts mean equal trees.
+    static std::string library_strings(word root) {
+        std::string out;
+        std::vector<NodeView> pending{NodeView{root}};
+        while (!pending.empty()) {
+            const NodeView n = pending.back();
+            pending.pop_back();
+            if (!n) {
+                out += '-';
+                continue;
+            }
+            const std::string v = n.string();
+            out += std::to_string(v.size()) + ':' + v;
+            pending.push_back(n.right());
+            pending.push_back(n.left());
+        }
+        return out;
+    }
+
+    // The string index read back through StringElementAt$, each entry with
+    // its length; the result flags are put back as they were.
+    std::string library_index(Subject& s) {
+        std::string out;
+        if (s.indexes[kStrings] == 0) {
+            return out;
+        }
+        const std::uint16_t flags = s.host->result_flags();
+        for (std::int32_t p = 0; p < s.host->count(kStrings); ++p) {
+            const std::string v = Host::text_at(host_.expression(*s.host, 11, {Param::of(p)}, 0));
+            out += std::to_string(v.size()) + ':' + v;
+        }
+        s.host->set_result_flags(flags);
+        host_.clear_calls();
+        return out;
+    }
+
+    static std::string model_index(const fuzzmodel::Instance& m) {
+        std::string out;
+        for (const int slot : m.strings().index) {
+            const std::string& v = m.strings().at(slot).value;
+            out += std::to_string(v.size()) + ':' + v;
+        }
+        return out;
+    }
+
+    static std::string model_strings(const fuzzmodel::Instance& m) {
+        const fuzzmodel::Collection<std::string>& c = m.strings();
+        std::string out;
+        std::vector<int> pending{c.root};
+        while (!pending.empty()) {
+            const int at = pending.back();
+            pending.pop_back();
+            if (at == fuzzmodel::kNone) {
+                out += '-';
+                continue;
+            }
+            out += std::to_string(c.at(at).value.size()) + ':' + c.at(at).value;
+            pending.push_back(c.at(at).right);
+            pending.push_back(c.at(at).left);
+        }
+        return out;
     }
 
     // Runs an expression and checks everything about it; used both for the
@@ -1067,16 +1219,24 @@ private:
             static constexpr std::array<std::size_t, 3> kAdds = {0, 6, 3};
             action(s, kAdds[kind - 28]);
         } else {
-            static constexpr std::array<std::size_t, 3> kAdds = {0, 3, 6};
+            // An add or a load during which one allocation fails.
             const std::uint8_t b = in_.byte();
-            action(s, kAdds[b % 3], (b >> 2) % 3);
+            if (b % 4 == 3) {
+                // Half the time one of the first three allocations: the file
+                // buffer, the balanced bookkeeping, the first line's node.
+                action(s, 9, (b & 4) != 0 ? (b >> 3) % 3 : (b >> 3) % 32);
+            } else {
+                static constexpr std::array<std::size_t, 3> kAdds = {0, 3, 6};
+                action(s, kAdds[b % 4], (b >> 2) % 3);
+            }
         }
     }
 
     static constexpr std::array<const char*, 12> kExpressionNames = {
-        "IntegersSize(",         "IntegersRandomElement(", "FloatsSize(",       "FloatsRandomElement(",
-        "StringsSize(",          "StringsRandomElement$(", "IndexOfIntegerElement(", "IntegerElementAt(",
-        "IndexOfFloatElement(", "FloatElementAt(",        "IndexOfStringElement(",  "StringElementAt$("};
+        "IntegersSize(",          "IntegersRandomElement(", "FloatsSize(",
+        "FloatsRandomElement(",   "StringsSize(",           "StringsRandomElement$(",
+        "IndexOfIntegerElement(", "IntegerElementAt(",      "IndexOfFloatElement(",
+        "FloatElementAt(",        "IndexOfStringElement(",  "StringElementAt$("};
 
     Input& in_;
     Values values_;
@@ -1084,6 +1244,7 @@ private:
     std::vector<Subject> subjects_;
     std::size_t event_number_ = 0;
     std::size_t handler_calls_ = 0;
+    std::size_t live_at_start_ = sorvel::memory::live_allocations();
     std::size_t sweeps_ = 0;
 };
 

@@ -262,7 +262,9 @@ int compare_strings(const std::string& a, const std::string& b, bool case_sensit
 
 Instance::Instance(std::int32_t case_word, std::int32_t index_word) : case_word_(case_word), index_word_(index_word) {}
 
-bool Instance::contains_integer(std::int32_t v) const { return tree_contains(integers_, v, compare_integers); }
+bool Instance::contains_integer(std::int32_t v) const {
+    return tree_contains(integers_, v, compare_integers);
+}
 
 bool Instance::contains_float(float v) const {
     if (v != v) {  // a NaN is never held
@@ -277,14 +279,19 @@ bool Instance::contains_string(const Text& v) const {
         return false;
     }
     const bool cs = case_sensitive();
-    return tree_contains(strings_, *s, [cs](const std::string& a, const std::string& b) {
-        return compare_strings(a, b, cs);
-    });
+    return tree_contains(strings_, *s,
+                         [cs](const std::string& a, const std::string& b) { return compare_strings(a, b, cs); });
 }
 
-void Instance::add_integer(std::int32_t v) { tree_add(integers_, v, indexed(), compare_integers); }
-void Instance::remove_integer(std::int32_t v) { tree_remove(integers_, v, indexed(), compare_integers); }
-void Instance::clear_integers() { tree_clear(integers_); }
+void Instance::add_integer(std::int32_t v) {
+    tree_add(integers_, v, indexed(), compare_integers);
+}
+void Instance::remove_integer(std::int32_t v) {
+    tree_remove(integers_, v, indexed(), compare_integers);
+}
+void Instance::clear_integers() {
+    tree_clear(integers_);
+}
 
 void Instance::add_float(float v) {
     if (v != v) {
@@ -300,7 +307,9 @@ void Instance::remove_float(float v) {
     tree_remove(floats_, v, indexed(), compare_floats);
 }
 
-void Instance::clear_floats() { tree_clear(floats_); }
+void Instance::clear_floats() {
+    tree_clear(floats_);
+}
 
 void Instance::add_string(const Text& v) {
     const auto s = c_string(v);
@@ -322,16 +331,25 @@ void Instance::remove_string(const Text& v) {
                 [cs](const std::string& a, const std::string& b) { return compare_strings(a, b, cs); });
 }
 
-void Instance::clear_strings() { tree_clear(strings_); }
+void Instance::clear_strings() {
+    tree_clear(strings_);
+}
 
-void Instance::load(const std::optional<std::string>& file, std::int32_t balance, Draws& draws) {
+void Instance::load(const std::optional<std::string>& file, std::int32_t balance, Draws& draws,
+                    std::optional<std::size_t> left_out) {
     if (!file) {
         return;
     }
     std::vector<std::string> lines = split_lines(*file);
+    std::size_t adds = 0;
+    const auto add_line = [&](const std::string& line) {
+        if (adds++ != left_out) {
+            add_string(line);
+        }
+    };
     if (balance == 0) {
         for (const std::string& line : lines) {
-            add_string(line);
+            add_line(line);
         }
         return;
     }
@@ -341,13 +359,17 @@ void Instance::load(const std::optional<std::string>& file, std::int32_t balance
         const std::size_t k = static_cast<std::size_t>(r & 0x7FFF) % n;
         const std::string line = lines[k];
         lines.erase(lines.begin() + static_cast<std::ptrdiff_t>(k));
-        add_string(line);
+        add_line(line);
     }
 }
 
-std::int32_t Instance::integers_random(Draws& draws) const { return random_path(integers_, draws).value_or(0); }
+std::int32_t Instance::integers_random(Draws& draws) const {
+    return random_path(integers_, draws).value_or(0);
+}
 
-float Instance::floats_random(Draws& draws) const { return random_path(floats_, draws).value_or(0.0F); }
+float Instance::floats_random(Draws& draws) const {
+    return random_path(floats_, draws).value_or(0.0F);
+}
 
 std::string Instance::strings_random(Draws& draws) const {
     return random_path(strings_, draws).value_or(std::string());

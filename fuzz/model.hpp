@@ -84,7 +84,10 @@ public:
     void remove_string(const Text& v);
     void clear_strings();
     // `file` is the file's bytes, or nullopt when it cannot be opened.
-    void load(const std::optional<std::string>& file, std::int32_t balance, Draws& draws);
+    // `left_out`: the number (from 0) of a line whose add is left out, as
+    // when memory runs out for that one line.
+    void load(const std::optional<std::string>& file, std::int32_t balance, Draws& draws,
+              std::optional<std::size_t> left_out = std::nullopt);
 
     // Expressions.
     std::int32_t integers_size() const { return integers_.count; }
