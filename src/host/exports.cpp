@@ -114,11 +114,4 @@ SORVEL_EXPORT word SORVEL_CALL HandleRunObject(word) { return 2; }
 // undefined give 0.
 #define SORVEL_STUB(name, ordinal, params, result) \
     SORVEL_EXPORT word SORVEL_CALL name params { return result; }
-#define SORVEL_ARGS0 ()
-#define SORVEL_ARGS1 (word)
-#define SORVEL_ARGS2 (word, word)
-#define SORVEL_ARGS3 (word, word, word)
-#define SORVEL_ARGS4 (word, word, word, word)
-#define SORVEL_ARGS5 (word, word, word, word, word)
-#define SORVEL_ARGS7 (word, word, word, word, word, word, word)
 SORVEL_STUB_LIST(SORVEL_STUB)

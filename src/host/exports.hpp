@@ -4,6 +4,15 @@
 
 #include "host/platform.hpp"
 
+// Argument lists by count: every argument is a host word.
+#define SORVEL_ARGS0 ()
+#define SORVEL_ARGS1 (sorvel::word)
+#define SORVEL_ARGS2 (sorvel::word, sorvel::word)
+#define SORVEL_ARGS3 (sorvel::word, sorvel::word, sorvel::word)
+#define SORVEL_ARGS4 (sorvel::word, sorvel::word, sorvel::word, sorvel::word)
+#define SORVEL_ARGS5 (sorvel::word, sorvel::word, sorvel::word, sorvel::word, sorvel::word)
+#define SORVEL_ARGS7 (sorvel::word, sorvel::word, sorvel::word, sorvel::word, sorvel::word, sorvel::word, sorvel::word)
+
 // The entry points with behaviour, defined in exports.cpp:
 // X(name, ordinal, argument count)
 #define SORVEL_EXPORT_LIST(X)          \

@@ -10,18 +10,7 @@ using sorvel::testhost::word;
 
 // Declarations with the library's argument counts and calling convention,
 // so that on 32-bit Windows the decorated names match the definitions.
-#define TESTHOST_PARAMS_0 ()
-#define TESTHOST_PARAMS_1 (word)
-#define TESTHOST_PARAMS_2 (word, word)
-#define TESTHOST_PARAMS_3 (word, word, word)
-#define SORVEL_ARGS0 ()
-#define SORVEL_ARGS1 (word)
-#define SORVEL_ARGS2 (word, word)
-#define SORVEL_ARGS3 (word, word, word)
-#define SORVEL_ARGS4 (word, word, word, word)
-#define SORVEL_ARGS5 (word, word, word, word, word)
-#define SORVEL_ARGS7 (word, word, word, word, word, word, word)
-#define TESTHOST_DECLARE_EXPORT(name, ordinal, count) extern "C" word SORVEL_CALL name TESTHOST_PARAMS_##count;
+#define TESTHOST_DECLARE_EXPORT(name, ordinal, count) extern "C" word SORVEL_CALL name SORVEL_ARGS##count;
 #define TESTHOST_DECLARE_STUB(name, ordinal, params, result) extern "C" word SORVEL_CALL name params;
 SORVEL_EXPORT_LIST(TESTHOST_DECLARE_EXPORT)
 SORVEL_STUB_LIST(TESTHOST_DECLARE_STUB)
