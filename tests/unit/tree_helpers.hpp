@@ -55,11 +55,9 @@ using Floats = Holder<float>;
 using Strings = Holder<char*>;
 
 // One spelling of each operation for all three kinds, so tests can be typed.
-inline bool do_add(Ints& h, std::int32_t v) {
-    auto c = h.view();
-    return add(c, v);
-}
-inline bool do_add(Floats& h, float v) {
+template <class V>
+    requires std::is_arithmetic_v<V>
+inline bool do_add(Holder<V>& h, std::type_identity_t<V> v) {
     auto c = h.view();
     return add(c, v);
 }
@@ -67,11 +65,9 @@ inline bool do_add(Strings& h, const std::string& v) {
     auto c = h.view();
     return AddStringValue(c, v.c_str(), h.case_sensitive);
 }
-inline bool do_remove(Ints& h, std::int32_t v) {
-    auto c = h.view();
-    return remove(c, v);
-}
-inline bool do_remove(Floats& h, float v) {
+template <class V>
+    requires std::is_arithmetic_v<V>
+inline bool do_remove(Holder<V>& h, std::type_identity_t<V> v) {
     auto c = h.view();
     return remove(c, v);
 }
