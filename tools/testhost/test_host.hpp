@@ -103,6 +103,15 @@ public:
     // For the test that proves the check itself catches a wrong callee.
     static void reset_stack_errors();
 
+    // The library's allocations where the host can reach them: its own
+    // counter when it is linked in, the host's C runtime for an image the
+    // host mapped itself. Null for a library the system loader loaded.
+    struct Allocations {
+        std::size_t (*live)();
+        void (*fail_after)(long n);  // the n-th allocation from now fails; negative: none
+    };
+    const Allocations* allocations() const { return allocations_; }
+
 private:
     struct Symbol {
         const char* name;
@@ -112,6 +121,7 @@ private:
     void* handle_ = nullptr;
     bool owned_ = false;
     bool loader_owned_ = false;
+    const Allocations* allocations_ = nullptr;
     std::vector<Symbol> symbols_;  // linked in: the program's own table
 };
 
