@@ -3,9 +3,9 @@
 // the test host (the library linked in, so libFuzzer sees its coverage, and
 // the test host's own rand, so every draw is scripted and counted), and after
 // every event holds the library against the reference model in model.hpp:
-// results, counts, result flags, host calls and their arguments, draws, the
-// header bytes the library may not touch, tree shapes and (in sweeps and at
-// the end) insertion order. Any difference aborts with a description of the
+// results, counts, result flags, host calls and their arguments, draws and
+// the header bytes the library may not touch; tree shapes every few events,
+// insertion order in sweeps, and both at the end of every input. Any difference aborts with a description of the
 // event and the ones before it, and libFuzzer keeps the input.
 //
 // Input: one byte for the number of instances, then per instance a byte of
@@ -23,6 +23,7 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
+#include <functional>
 #include <limits>
 #include <memory>
 #include <optional>
@@ -30,8 +31,10 @@
 #include <utility>
 #include <vector>
 
-#include "collections/memory.hpp"
+#include "driver.hpp"
+#include "exports_table.hpp"
 #include "model.hpp"
+#include "support.hpp"
 #include "test_host.hpp"
 
 namespace {
@@ -54,11 +57,13 @@ constexpr std::size_t kMaxFileBytes = 160;
 constexpr std::size_t kMinManyLines = 60;
 constexpr std::size_t kMaxManyLines = 700;
 constexpr std::size_t kManyLinesPerInput = 2000;
+constexpr std::size_t kMaxSortedLines = 150;
 constexpr std::size_t kPoolSize = 48;
 constexpr std::size_t kHistory = 40;
-constexpr std::size_t kSweepFull = 64;  // larger collections are sampled
-constexpr std::size_t kMaxSweeps = 8;   // per input, besides the final one
+constexpr std::size_t kSweepFull = 24;  // larger collections are sampled
+constexpr std::size_t kMaxSweeps = 2;   // per input, besides the final one
 constexpr std::size_t kMaxFailingLoadLines = 100;
+constexpr std::size_t kTreeEvery = 8;  // events between whole-tree comparisons
 
 constexpr std::uint16_t kFloatFlag = 0x4000;
 constexpr std::uint16_t kStringFlag = 0x8000;
@@ -72,8 +77,21 @@ constexpr std::array<std::int32_t, 4> kOptionWords = {-1, 0, 1, 2};
 
 // ------------------------------------------------------------ reporting
 
-std::vector<std::string> g_history;
-std::string g_current;
+// The recent events, described only when a difference is found: building
+// the texts for every event would cost more than running the events.
+struct Described {
+    std::size_t number = 0;
+    int instance = 0;
+    std::int32_t case_word = 0;
+    std::int32_t index_word = 0;
+    std::function<std::string()> what;
+    std::string text() const {
+        return "#" + std::to_string(number) + " instance " + std::to_string(instance) + " (case " +
+               std::to_string(case_word) + ", index " + std::to_string(index_word) + "): " + what();
+    }
+};
+std::array<Described, kHistory> g_history;
+std::size_t g_events = 0;  // described so far in this input
 // SORVEL_FUZZ_TRACE=1 prints every event as it runs, to read an input back.
 const bool g_trace = std::getenv("SORVEL_FUZZ_TRACE") != nullptr;
 
@@ -109,27 +127,22 @@ std::string show_float(std::uint32_t bits) {
 
 [[noreturn]] void mismatch(const std::string& what) {
     std::fprintf(stderr, "\n=== sorvel differential fuzzer: MISMATCH\n");
-    std::fprintf(stderr, "event: %s\n", g_current.c_str());
+    if (g_events > 0) {
+        std::fprintf(stderr, "event: %s\n", g_history[(g_events - 1) % kHistory].text().c_str());
+    }
     std::fprintf(stderr, "what:  %s\n", what.c_str());
     std::fprintf(stderr, "recent events (oldest first):\n");
-    const std::size_t from = g_history.size() > kHistory ? g_history.size() - kHistory : 0;
-    for (std::size_t i = from; i < g_history.size(); ++i) {
-        std::fprintf(stderr, "  %s\n", g_history[i].c_str());
+    for (std::size_t i = g_events > kHistory ? g_events - kHistory : 0; i < g_events; ++i) {
+        std::fprintf(stderr, "  %s\n", g_history[i % kHistory].text().c_str());
     }
     std::fflush(stderr);
     std::abort();
 }
 
 template <class T>
-void expect_equal(const T& got, const T& want, const std::string& what) {
+void expect_equal(const T& got, const T& want, const char* what) {
     if (!(got == want)) {
-        mismatch(what + ": library " + std::to_string(got) + ", model " + std::to_string(want));
-    }
-}
-
-void expect_text(const std::string& got, const std::string& want, const std::string& what) {
-    if (got != want) {
-        mismatch(what + ": library " + show(got) + ", model " + show(want));
+        mismatch(std::string(what) + ": library " + std::to_string(got) + ", model " + std::to_string(want));
     }
 }
 
@@ -372,11 +385,20 @@ public:
     // with letters in either case, zero bytes and blank lines, or sorted.
     std::string many_lines() {
         // A budget per input keeps an input of many big loads fast.
-        std::size_t lines = kMinManyLines + in_.u16() % (kMaxManyLines - kMinManyLines + 1);
+        // Long loads are rarer than short ones: a line costs about as much as
+        // an event, so inputs full of long loads would starve the rest.
+        const std::uint16_t size = in_.u16();
+        std::size_t lines = kMinManyLines + (size % (kMaxManyLines - kMinManyLines + 1) >> (size >> 14) * 2);
         lines = lines < many_lines_left_ ? lines : many_lines_left_;
         many_lines_left_ -= lines;
         const std::uint32_t modulus = 1U + in_.u16();
         const std::uint8_t style = in_.byte();
+        if ((style & 8) != 0 && lines > kMaxSortedLines) {
+            // Sorted lines loaded in file order make a chain, and the model
+            // descends it literally: quadratic in the chain's length.
+            many_lines_left_ += lines - kMaxSortedLines;
+            lines = kMaxSortedLines;
+        }
         std::uint64_t state = in_.u32();
         static constexpr std::array<const char*, 5> kEnds = {"\n", "\r\n", "\r", "\n\n", "\n\r"};
         std::string bytes;
@@ -421,10 +443,12 @@ public:
                 default: out.push_back(next() & 0xFF); break;
             }
         }
-        return out;
+        // Where the runtime's generator cannot be scripted (a Windows C
+        // runtime shared with a loaded DLL), the values are the generator's
+        // own, learnt in advance from a seed the input chose.
+        return draws::scriptable() ? out : draws::reseed(static_cast<unsigned>(mix(state)), n);
     }
 
-private:
     // splitmix64: a stream of well-mixed values from one seed.
     static std::uint64_t mix(std::uint64_t& state) {
         state += 0x9E3779B97F4A7C15ULL;
@@ -434,6 +458,7 @@ private:
         return z ^ (z >> 31);
     }
 
+private:
     Input& in_;
     std::size_t many_lines_left_ = kManyLinesPerInput;
     Pool<std::int32_t> ints_;
@@ -443,17 +468,22 @@ private:
 
 // ------------------------------------------------------------ the file
 
-// One file per process, so parallel fuzzing jobs do not share it.
+// One file per process, so parallel fuzzing jobs do not share it; in memory
+// where the system offers it, as a file is written for every load.
+std::filesystem::path file_folder() {
+    std::error_code error;
+    return std::filesystem::is_directory("/dev/shm", error) ? std::filesystem::path("/dev/shm")
+                                                            : std::filesystem::temp_directory_path();
+}
+
 const std::string& file_path() {
-    static const std::string path =
-        (std::filesystem::temp_directory_path() / ("sorvel-fuzz-" + std::to_string(::getpid()) + ".txt")).string();
+    static const std::string path = (file_folder() / ("sorvel-fuzz-" + std::to_string(::getpid()) + ".txt")).string();
     return path;
 }
 
 const std::string& missing_path() {
-    static const std::string path = (std::filesystem::temp_directory_path() /
-                                     ("sorvel-fuzz-" + std::to_string(::getpid()) + "-missing") / "none.txt")
-                                        .string();
+    static const std::string path =
+        (file_folder() / ("sorvel-fuzz-" + std::to_string(::getpid()) + "-missing") / "none.txt").string();
     return path;
 }
 
@@ -507,9 +537,13 @@ const char* routine_name(Routine r) {
 
 class Session {
 public:
-    explicit Session(Input& in) : in_(in), values_(in), host_(Library::linked_in()) {}
+    explicit Session(Input& in)
+        : in_(in), values_(in), host_(fuzzdriver::library()), allocations_(host_.library().allocations()) {
+        live_at_start_ = allocations_ != nullptr ? allocations_->live() : 0;
+    }
 
     void run() {
+        call_exports();
         const std::size_t instances = 1 + in_.byte() % 3;
         for (std::size_t i = 0; i < instances; ++i) {
             subjects_.emplace_back();
@@ -527,24 +561,61 @@ public:
             sweep(s);
         }
         for (Subject& s : subjects_) {
-            begin("DestroyRunObject", s);
+            begin(s, named("DestroyRunObject"));
             host_.destroy(*s.host);
         }
         // Every node, string, index and reader the instances had is freed.
-        expect_equal(sorvel::memory::live_allocations(), live_at_start_, "library allocations still live");
+        if (allocations_ != nullptr) {
+            expect_equal(allocations_->live(), live_at_start_, "library allocations still live");
+        }
     }
 
 private:
     // -------------------------------------------------- bookkeeping
 
-    void begin(const std::string& what, const Subject& s) {
-        g_current = "#" + std::to_string(event_number_) + " instance " + std::to_string(s.number) + " (case " +
-                    std::to_string(s.model->case_word()) + ", index " + std::to_string(s.model->index_word()) +
-                    "): " + what;
-        g_history.push_back(g_current);
-        if (g_trace) {
-            std::fprintf(stderr, "%s\n", g_current.c_str());
+    // Every export once per input, with words the input chose: the stubs
+    // give their fixed answers whatever they are given, and call nothing.
+    void call_exports() {
+        Library& library = host_.library();
+        std::uint64_t state = in_.u32();
+        const std::int32_t code = in_.small() % 10;
+        for (const sorvel::test::ExportEntry& e : sorvel::test::kExports) {
+            std::array<word, 7> w{};
+            for (word& x : w) {
+                x = static_cast<word>(static_cast<std::int32_t>(Values::mix(state)));
+            }
+            word want = e.answer;
+            if (std::string_view(e.name) == "GetInfos") {
+                w[0] = code;
+                want = 0;
+                for (const auto& a : sorvel::test::kInfoAnswers) {
+                    want = a.code == code ? a.answer : want;
+                }
+            } else if (std::string_view(e.name) == "GetRunObjectDataSize") {
+                want = static_cast<word>(RecordLayout::kRunRecordSize);
+            } else if (std::string_view(e.name) == "HandleRunObject") {
+                want = 2;
+            } else if (!e.stub) {
+                continue;  // the rest take the host's records: the session calls them
+            }
+            if (sorvel::test::call_with(library, library.symbol(e.name), e.args, w) != want) {
+                mismatch(std::string(e.name) + " does not give " + std::to_string(want));
+            }
         }
+        expect_equal(host_.calls().size(), std::size_t{0}, "host calls made by exports");
+    }
+
+    // `what` describes the event; it runs only when the event is shown.
+    void begin(const Subject& s, std::function<std::string()> what) {
+        Described& d = g_history[g_events++ % kHistory];
+        d = {event_number_, s.number, s.model->case_word(), s.model->index_word(), std::move(what)};
+        if (g_trace) {
+            std::fprintf(stderr, "%s\n", d.text().c_str());
+        }
+    }
+
+    static std::function<std::string()> named(const char* what) {
+        return [what] { return std::string(what); };
     }
 
     void create(Subject& s, int number) {
@@ -555,7 +626,7 @@ private:
         const auto creation12 = static_cast<std::int32_t>(static_cast<std::uint32_t>(options) * 0x91000193U);
         s.number = number;
         s.model = std::make_unique<fuzzmodel::Instance>(case_word, index_word);
-        begin("CreateRunObject", s);
+        begin(s, named("CreateRunObject"));
         s.host = &host_.create(case_word, index_word, creation8, creation12);
         Instance& h = *s.host;
         expect_equal(h.i32(RecordLayout::kCaseSensitive), case_word, "case-sensitive flag as stored");
@@ -603,28 +674,31 @@ private:
 
     void check_calls(const std::vector<ExpectedCall>& expected) {
         const std::vector<HostCall>& got = host_.calls();
-        std::string listing;
-        for (const HostCall& c : got) {
-            listing += std::string(" ") + routine_name(c.routine) + "(";
-            for (std::size_t a = 0; a < c.args.size(); ++a) {
-                listing += (a == 0 ? "" : ",") + std::to_string(c.args[a]);
+        const auto listing = [&got] {
+            std::string out;
+            for (const HostCall& c : got) {
+                out += std::string(" ") + routine_name(c.routine) + "(";
+                for (std::size_t a = 0; a < c.args.size(); ++a) {
+                    out += (a == 0 ? "" : ",") + std::to_string(c.args[a]);
+                }
+                out += ")";
             }
-            listing += ")";
-        }
+            return out;
+        };
         if (got.size() != expected.size()) {
             mismatch("host calls: " + std::to_string(got.size()) + " made, " + std::to_string(expected.size()) +
-                     " expected; made:" + listing);
+                     " expected; made:" + listing());
         }
         for (std::size_t i = 0; i < got.size(); ++i) {
             if (got[i].routine != expected[i].routine || got[i].args.size() != expected[i].args.size()) {
                 mismatch("host call " + std::to_string(i) + " is " + routine_name(got[i].routine) + ", expected " +
-                         routine_name(expected[i].routine) + "; made:" + listing);
+                         routine_name(expected[i].routine) + "; made:" + listing());
             }
             for (std::size_t a = 0; a < got[i].args.size(); ++a) {
                 if (expected[i].args[a] && *expected[i].args[a] != got[i].args[a]) {
                     mismatch(std::string("argument ") + std::to_string(a) + " of " + routine_name(got[i].routine) +
                              ": " + std::to_string(got[i].args[a]) + ", expected " +
-                             std::to_string(*expected[i].args[a]) + "; made:" + listing);
+                             std::to_string(*expected[i].args[a]) + "; made:" + listing());
                 }
             }
         }
@@ -641,7 +715,11 @@ private:
         const auto flags = static_cast<std::uint16_t>((++handler_calls_ * 0x9E37U + 0x1234U) & 0xFFFFU);
         s.host->set_result_flags(flags);
         host_.clear_calls();
-        draws::script(std::move(script));
+        if (draws::scriptable()) {
+            draws::script(std::move(script));
+        } else if (script.empty()) {
+            draws::reseed(0, 0);  // counting starts here
+        }
         return flags;
     }
 
@@ -650,10 +728,14 @@ private:
         expect_equal(s.host->result_flags(), static_cast<std::uint16_t>(flags_before | flags_added), "result flags");
         expect_equal(draws::made(), draws_used, "draws made");
         for (int c = 0; c < 3; ++c) {
-            expect_equal(s.host->count(c), count_of(*s.model, c), "count of collection " + std::to_string(c));
+            static constexpr std::array<const char*, 3> kCounts = {"integer count", "float count", "string count"};
+            expect_equal(s.host->count(c), count_of(*s.model, c), kCounts[static_cast<std::size_t>(c)]);
         }
         check_header(s);
-        if (touched >= 0) {
+        // Whole trees are compared on a schedule (and at the end of every
+        // input): results, counts, calls and draws already show most faults
+        // at once, and a walk per event would cost more than the event.
+        if (touched >= 0 && event_number_ % kTreeEvery == 0) {
             compare_tree(s, touched);
         }
     }
@@ -669,16 +751,16 @@ private:
     // Walks both trees side by side; a missing or extra node, or a value
     // that differs (floats by their bits), is a mismatch.
     template <class V, class Same, class Show>
-    void walk(word root, const fuzzmodel::Collection<V>& c, const Same& same, const Show& describe,
-              const std::string& name) {
+    void walk(word root, const fuzzmodel::Collection<V>& c, const Same& same, const Show& describe, const char* name) {
         std::vector<std::pair<NodeView, int>> pending{{NodeView{root}, c.root}};
         std::size_t nodes = 0;
         while (!pending.empty()) {
-            const auto [lib, mod] = pending.back();
+            const NodeView lib = pending.back().first;
+            const int mod = pending.back().second;
             pending.pop_back();
-            const std::string where = name + " tree, under model node " + std::to_string(mod);
+            const auto where = [&] { return std::string(name) + " tree, under model node " + std::to_string(mod); };
             if (static_cast<bool>(lib) != (mod != fuzzmodel::kNone)) {
-                mismatch(where + ": library has " + (lib ? "a node" : "none") + ", model " +
+                mismatch(where() + ": library has " + (lib ? "a node" : "none") + ", model " +
                          (mod != fuzzmodel::kNone ? "a node holding " + describe(c.at(mod).value) : "none"));
             }
             if (!lib) {
@@ -686,13 +768,14 @@ private:
             }
             ++nodes;
             if (!same(lib, c.at(mod).value)) {
-                mismatch(where + ": value differs, model " + describe(c.at(mod).value));
+                mismatch(where() + ": value differs, model " + describe(c.at(mod).value));
             }
             pending.emplace_back(lib.left(), c.at(mod).left);
             pending.emplace_back(lib.right(), c.at(mod).right);
         }
         if (nodes != static_cast<std::size_t>(c.count)) {
-            mismatch(name + " model tree holds " + std::to_string(nodes) + " nodes, count " + std::to_string(c.count));
+            mismatch(std::string(name) + " model tree holds " + std::to_string(nodes) + " nodes, count " +
+                     std::to_string(c.count));
         }
     }
 
@@ -742,14 +825,14 @@ private:
         bool want = false;
         Param p;
         ExpectedCall call;
-        std::string what;
+        std::function<std::string()> what;
         switch (number) {
             case 0: {
                 const std::int32_t v = values_.integer();
                 want = s.model->contains_integer(v);
                 p = Param::of(v);
                 call = event_param(s, 0);
-                what = "Contains Integer " + std::to_string(v);
+                what = [v] { return "Contains Integer " + std::to_string(v); };
                 break;
             }
             case 1: {
@@ -757,7 +840,7 @@ private:
                 want = s.model->contains_float(std::bit_cast<float>(bits));
                 p = float_param(bits);
                 call = event_param(s, 2);
-                what = "Contains Float " + show_float(bits);
+                what = [bits] { return "Contains Float " + show_float(bits); };
                 break;
             }
             default: {
@@ -765,11 +848,11 @@ private:
                 want = s.model->contains_string(t);
                 p = text_param(t);
                 call = event_param(s, -1);
-                what = "Contains String " + show(t);
+                what = [t] { return "Contains String " + show(t); };
                 break;
             }
         }
-        begin(what, s);
+        begin(s, std::move(what));
         const std::uint16_t flags = prepare(s, {});
         const word got = host_.condition(*s.host, number, {p});
         expect_equal(got, static_cast<word>(want ? 1 : 0), "condition result");
@@ -780,6 +863,9 @@ private:
     // `failing_allocation`: for an add, the library's allocation (counted
     // from 0 within the event) that is made to fail, or -1.
     void action(Subject& s, std::size_t number, long failing_allocation = -1) {
+        if (allocations_ == nullptr) {
+            failing_allocation = -1;
+        }
         std::optional<fuzzmodel::Instance> before;
         if (failing_allocation >= 0) {
             before.emplace(*s.model);
@@ -787,7 +873,7 @@ private:
         std::vector<Param> params;
         std::vector<ExpectedCall> calls;
         std::vector<int> script;
-        std::string what;
+        std::function<std::string()> what;
         int touched = kIntegers;
         fuzzmodel::Draws model_draws({});
         std::optional<bool> opens;  // for Load From File: whether the file opens
@@ -802,10 +888,10 @@ private:
             case 1: {
                 const std::int32_t v = values_.integer();
                 if (number == 0) {
-                    what = "Add Integer " + std::to_string(v);
+                    what = [v] { return "Add Integer " + std::to_string(v); };
                     s.model->add_integer(v);
                 } else {
-                    what = "Remove Integer " + std::to_string(v);
+                    what = [v] { return "Remove Integer " + std::to_string(v); };
                     s.model->remove_integer(v);
                 }
                 params = {Param::of(v)};
@@ -813,7 +899,7 @@ private:
                 break;
             }
             case 2:
-                what = "Clear Integers";
+                what = named("Clear Integers");
                 s.model->clear_integers();
                 break;
             case 3:
@@ -821,10 +907,10 @@ private:
                 const std::uint32_t bits = values_.float_bits();
                 const float v = std::bit_cast<float>(bits);
                 if (number == 3) {
-                    what = "Add Float " + show_float(bits);
+                    what = [bits] { return "Add Float " + show_float(bits); };
                     s.model->add_float(v);
                 } else {
-                    what = "Remove Float " + show_float(bits);
+                    what = [bits] { return "Remove Float " + show_float(bits); };
                     s.model->remove_float(v);
                 }
                 params = {float_param(bits)};
@@ -833,7 +919,7 @@ private:
                 break;
             }
             case 5:
-                what = "Clear Floats";
+                what = named("Clear Floats");
                 s.model->clear_floats();
                 touched = kFloats;
                 break;
@@ -841,10 +927,10 @@ private:
             case 7: {
                 const Text t = values_.text();
                 if (number == 6) {
-                    what = "Add String " + show(t);
+                    what = [t] { return "Add String " + show(t); };
                     s.model->add_string(t);
                 } else {
-                    what = "Remove String " + show(t);
+                    what = [t] { return "Remove String " + show(t); };
                     s.model->remove_string(t);
                 }
                 params = {text_param(t)};
@@ -853,7 +939,7 @@ private:
                 break;
             }
             case 8:
-                what = "Clear Strings";
+                what = named("Clear Strings");
                 s.model->clear_strings();
                 touched = kStrings;
                 break;
@@ -881,11 +967,15 @@ private:
                     before.reset();
                 }
                 load = LoadArguments{contents, balance, lines};
-                what = "Load From File " +
-                       (contents ? "file of " + std::to_string(contents->size()) + " bytes, " + std::to_string(lines) +
-                                       " lines: " + show(contents->substr(0, 96)) + (contents->size() > 96 ? "..." : "")
-                                 : show(name)) +
-                       " balance " + std::to_string(balance);
+                const std::size_t size = contents ? contents->size() : 0;
+                what = [head = contents ? Text(contents->substr(0, 96)) : name, size, lines, balance,
+                        file = contents.has_value()] {
+                    return "Load From File " +
+                           (file ? "file of " + std::to_string(size) + " bytes, " + std::to_string(lines) +
+                                       " lines: " + show(head) + (size > 96 ? "..." : "")
+                                 : show(head)) +
+                           " balance " + std::to_string(balance);
+                };
                 params = {text_param(name), Param::of(balance)};
                 calls = {event_param(s, -1), event_param(s, 0)};
                 if (name) {
@@ -898,13 +988,19 @@ private:
             }
         }
         if (failing_allocation >= 0) {
-            what += ", allocation " + std::to_string(failing_allocation) + " failing";
+            what = [plain = std::move(what), failing_allocation] {
+                return plain() + ", allocation " + std::to_string(failing_allocation) + " failing";
+            };
         }
-        begin(what, s);
+        begin(s, std::move(what));
         const std::uint16_t flags = prepare(s, script);
-        sorvel::memory::fail_allocation_after(failing_allocation);
+        if (failing_allocation >= 0) {
+            allocations_->fail_after(failing_allocation);
+        }
         const word got = host_.action(*s.host, number, std::move(params));
-        sorvel::memory::fail_allocation_after(-1);
+        if (failing_allocation >= 0) {
+            allocations_->fail_after(-1);
+        }
         if (opens.value_or(false)) {
             // libFuzzer may end the process without running exit handlers.
             std::remove(file_path().c_str());
@@ -1054,22 +1150,27 @@ private:
         fuzzmodel::Draws model_draws(script);
         std::vector<Param> params;
         std::vector<ExpectedCall> calls;
-        std::string what = std::string(kExpressionNames[number]);
         if (integer_param) {
             params.push_back(Param::of(*integer_param));
             calls.push_back(expr_param(s, 0, param_word));
-            what += std::to_string(*integer_param);
         } else if (float_param_bits) {
             params.push_back(float_param(*float_param_bits));
             calls.push_back(expr_param(s, 2, param_word));
-            what += show_float(*float_param_bits);
         } else if (text_param_value) {
             params.push_back(text_param(*text_param_value));
             calls.push_back(expr_param(s, 1, param_word));
-            what += show(*text_param_value);
         }
-        what += ") word " + hex32(static_cast<std::uint32_t>(param_word));
-        begin(what, s);
+        begin(s, [number, integer_param, float_param_bits, text_param_value, param_word] {
+            std::string what = kExpressionNames[number];
+            if (integer_param) {
+                what += std::to_string(*integer_param);
+            } else if (float_param_bits) {
+                what += show_float(*float_param_bits);
+            } else if (text_param_value) {
+                what += show(*text_param_value);
+            }
+            return what + ") word " + hex32(static_cast<std::uint32_t>(param_word));
+        });
 
         enum class Result { integer, floating, text };
         Result kind = Result::integer;
@@ -1125,7 +1226,9 @@ private:
                 if (got == 0 || got != host_.calls().back().result) {
                     mismatch("string result is not the buffer the host gave");
                 }
-                expect_text(Host::text_at(got), want_text, "string result");
+                if (const std::string text = Host::text_at(got); text != want_text) {
+                    mismatch("string result: library " + show(text) + ", model " + show(want_text));
+                }
                 finish(s, flags, kStringFlag, model_draws.used(), -1);
                 break;
         }
@@ -1205,7 +1308,10 @@ private:
         } else if (kind == 25 && sweeps_ < kMaxSweeps) {
             sweep(s);
         } else if (kind == 26) {
-            begin("DestroyRunObject, then a new instance in its place", s);
+            for (int c = 0; c < 3; ++c) {
+                compare_tree(s, c);
+            }
+            begin(s, named("DestroyRunObject, then a new instance in its place"));
             host_.destroy(*s.host);
             create(s, s.number);
         } else if (kind == 25 || kind == 27) {
@@ -1244,15 +1350,20 @@ private:
     std::vector<Subject> subjects_;
     std::size_t event_number_ = 0;
     std::size_t handler_calls_ = 0;
-    std::size_t live_at_start_ = sorvel::memory::live_allocations();
+    const Library::Allocations* allocations_;  // null: no failure can be injected
+    std::size_t live_at_start_ = 0;
     std::size_t sweeps_ = 0;
 };
 
 }  // namespace
 
+std::shared_ptr<Library>& fuzzdriver::library() {
+    static std::shared_ptr<Library> chosen = Library::linked_in();
+    return chosen;
+}
+
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
-    g_history.clear();
-    g_current.clear();
+    g_events = 0;
     Input in(data, size);
     {
         Session session(in);
@@ -1260,7 +1371,8 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     }
     // Nothing of this input may stay allocated, or libFuzzer runs it again
     // to look for a leak.
-    std::vector<std::string>().swap(g_history);
-    std::string().swap(g_current);
+    for (Described& d : g_history) {
+        d.what = nullptr;
+    }
     return 0;
 }

@@ -1,0 +1,17 @@
+// The differential driver: one fuzz input runs as events against the library
+// and the reference model. libFuzzer calls it, and so does the plain replay.
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+
+#include "test_host.hpp"
+
+namespace fuzzdriver {
+// The library the inputs run against: the one linked in, unless a caller
+// chose another before the first input.
+std::shared_ptr<sorvel::testhost::Library>& library();
+}  // namespace fuzzdriver
+
+extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size);

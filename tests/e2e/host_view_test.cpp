@@ -1,0 +1,257 @@
+// The library as a host sees it, where the differential fuzzer does not
+// look: exports by name and ordinal, the catalogue and information block,
+// the parameter word, result flags and space, allocation failure at
+// creation, and real files through the system.
+#include <gtest/gtest.h>
+
+#include <array>
+#include <filesystem>
+#include <fstream>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "e2e/e2e_fixture.hpp"
+#include "exports_table.hpp"
+#include "host/catalogue.hpp"
+#include "support.hpp"
+
+namespace {
+
+using sorvel::e2e::HostTest;
+using sorvel::testhost::Host;
+using sorvel::testhost::HostCall;
+using sorvel::testhost::Instance;
+using sorvel::testhost::Library;
+using sorvel::testhost::Param;
+using sorvel::testhost::RecordLayout;
+using sorvel::testhost::word;
+using Routine = HostCall::Routine;
+namespace catalogue = sorvel::catalogue;
+
+template <class T>
+T at(const unsigned char* bytes, std::size_t offset) {
+    T v;
+    std::memcpy(&v, bytes + offset, sizeof v);
+    return v;
+}
+
+TEST_F(HostTest, ExportsByNameAndOrdinalGiveTheirFixedAnswers) {
+    const std::array<std::array<word, 7>, 3> arguments{
+        {{0, 0, 0, 0, 0, 0, 0}, {-1, -1, -1, -1, -1, -1, -1}, {0x7FFFFFFF, 1, 0xDEAD, 0x1000, -2, 7, 0x55555555}}};
+    Library& library = host.library();
+    for (const sorvel::test::ExportEntry& e : sorvel::test::kExports) {
+        void* function = library.symbol(e.name);
+        ASSERT_NE(function, nullptr) << e.name;
+#if defined(_WIN32)
+        EXPECT_EQ(library.symbol_by_ordinal(e.ordinal), function) << e.name << " @" << e.ordinal;
+#endif
+        for (const auto& words : arguments) {
+            if (e.stub) {  // no stub reads its arguments: any dereference would fault
+                EXPECT_EQ(sorvel::test::call_with(library, function, e.args, words), e.answer) << e.name;
+            }
+        }
+    }
+    EXPECT_EQ(library.symbol("NoSuchExport"), nullptr);
+#if defined(_WIN32)
+    for (int unused : {1, 3, 113}) {
+        EXPECT_EQ(library.symbol_by_ordinal(unused), nullptr) << unused;
+    }
+#endif
+    for (word code : {-1, 0, 1, 2, 3, 6, 7, 8, 0x10002}) {
+        word answer = 0;
+        for (const auto& a : sorvel::test::kInfoAnswers) {
+            answer = a.code == code ? a.answer : answer;
+        }
+        EXPECT_EQ(library.call_export("GetInfos", {code}), answer) << "code " << code;
+    }
+    EXPECT_EQ(library.call_export("GetRunObjectDataSize", {-1, 0x1234}), RecordLayout::kRunRecordSize);
+    EXPECT_EQ(library.call_export("HandleRunObject", {0x1234}), 2);
+    EXPECT_TRUE(host.calls().empty()) << "no export calls the host";
+}
+
+TEST_F(HostTest, InformationBlockAndHandlerTables) {
+    for (unsigned char fill : {0x00, 0xAB}) {
+        host.read_infos(fill);
+        const unsigned char* b = host.info_block().data();
+        EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoCounts), 3);
+        EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoCounts + 2), 10);
+        EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoCounts + 4), 12);
+        EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoCounts + 6), 28) << "EditRecord size";
+        EXPECT_EQ(at<std::int32_t>(b, RecordLayout::kInfoFlags), 2305);
+        EXPECT_EQ(b[RecordLayout::kInfoLetter], 'd');
+        EXPECT_EQ(b[RecordLayout::kInfoUntouched], fill) << "byte 25 is the host's";
+        EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoZero), 0);
+        EXPECT_EQ(std::string(reinterpret_cast<const char*>(b) + RecordLayout::kInfoIdentifier, 4), "LVRS");
+        EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoVersion), 1);
+        EXPECT_EQ(b[RecordLayout::kInfoSize], fill) << "nothing written beyond the block";
+    }
+    // Every handler once, each table ending in a null; later loader calls
+    // find the same tables.
+    const Host::Tables first = host.tables();
+    host.dll_main(2);
+    host.dll_main(3);
+    std::vector<word> handlers;
+    for (int kind = 0; kind < 3; ++kind) {
+        const std::size_t n = kind == 0 ? 3 : kind == 1 ? 10 : 12;
+        for (std::size_t i = 0; i < n; ++i) {
+            handlers.push_back(host.table_entry(kind, i));
+            EXPECT_NE(handlers.back(), 0);
+        }
+        EXPECT_EQ(host.table_entry(kind, n), 0);
+    }
+    std::sort(handlers.begin(), handlers.end());
+    EXPECT_EQ(std::unique(handlers.begin(), handlers.end()), handlers.end()) << "25 distinct handlers";
+    EXPECT_EQ(host.tables().actions, first.actions);
+}
+
+TEST(Catalogue, DisplayStringsTitlesAndNumbering) {
+    struct Row {
+        const char* display;
+        int number;
+        const char* titles;
+    };
+    const std::array<Row, 25> rows{{
+        {"%o: Contains Integer: %0", 0, "Enter Integer"},
+        {"%o: Contains Float: %0", 1, "Enter Float"},
+        {"%o: Contains String: %0", 2, "Enter String"},
+        {"Add Integer: %0", 0, "Enter Integer"},
+        {"Remove Integer: %0", 1, "Enter Integer"},
+        {"Clear Integers", 2, ""},
+        {"Add Float: %0", 3, "Enter Float"},
+        {"Remove Float: %0", 4, "Enter Float"},
+        {"Clear Floats", 5, ""},
+        {"Add String: %0", 6, "Enter String"},
+        {"Remove String: %0", 7, "Enter String"},
+        {"Clear Strings", 8, ""},
+        {"Load From File: %0 into Strings (Balance: %1)", 9, "Enter Text File|Balance? (1 = Yes, 0 = No)"},
+        {"IntegersSize(", 0, ""},
+        {"IntegersRandomElement(", 1, ""},
+        {"FloatsSize(", 2, ""},
+        {"FloatsRandomElement(", 3, ""},
+        {"StringsSize(", 4, ""},
+        {"StringsRandomElement$(", 5, ""},
+        {"IndexOfIntegerElement(", 6, "Enter Integer Element"},
+        {"IntegerElementAt(", 7, "Enter Index of Integer"},
+        {"IndexOfFloatElement(", 8, "Enter Float Element"},
+        {"FloatElementAt(", 9, "Enter Index of Float"},
+        {"IndexOfStringElement(", 10, "Enter String Element"},
+        {"StringElementAt$(", 11, "Enter Index of String"},
+    }};
+    for (std::size_t i = 0; i < rows.size(); ++i) {
+        const catalogue::Event& e = catalogue::kEvents[i];
+        std::string titles;
+        for (std::size_t p = 0; p < e.param_count; ++p) {
+            titles += (p == 0 ? "" : "|") + std::string(e.params[p].title);
+        }
+        EXPECT_EQ(e.display, rows[i].display);
+        EXPECT_EQ(e.number, rows[i].number) << rows[i].display;
+        EXPECT_EQ(titles, rows[i].titles) << rows[i].display;
+    }
+    EXPECT_STREQ(catalogue::kOptions[1].name, "Use Indicies");
+}
+
+// Only the low 16 bits of an expression's parameter word reach the host,
+// sign-extended; results mark their type in the flags and keep the rest.
+TEST_F(HostTest, ParameterWordResultFlagsAndResultSpace) {
+    Instance& instance = host.create(0, 1);
+    host.action(instance, 3, {Param::of(1.5F)});
+    const std::vector<std::pair<word, word>> words = {{0x7FFF, 0x7FFF}, {0x8000, -0x8000},    {0xFFFF, -1},
+                                                      {0x10001, 1},     {0x12345678, 0x5678}, {-2, -2}};
+    for (const auto& [given, arrives] : words) {
+        host.clear_calls();
+        host.expression(instance, 7, {Param::of(std::int32_t{0})}, given);
+        ASSERT_EQ(host.calls().size(), 1U);
+        EXPECT_EQ(host.calls()[0].args[2], arrives) << given;
+    }
+    struct Flags {
+        std::size_t expression;
+        std::uint16_t before, after;
+    };
+    for (const Flags& f : std::vector<Flags>{{9, 0x0001, 0x4001},
+                                             {3, 0x8000, 0xC000},
+                                             {5, 0x4002, 0xC002},
+                                             {11, 0, 0x8000},
+                                             {0, 0xFFFF, 0xFFFF},
+                                             {7, 0x1234, 0x1234}}) {
+        instance.set_result_flags(f.before);
+        host.expression(instance, f.expression,
+                        f.expression >= 6 ? std::vector{Param::of(std::int32_t{0})} : std::vector<Param>{});
+        EXPECT_EQ(instance.result_flags(), f.after) << "expression " << f.expression;
+    }
+    // A host that gives no result space gets the empty string, not a write
+    // through a null pointer.
+    host.action(instance, 6, {Param::of("text")});
+    host.give_no_result_buffer(true);
+    EXPECT_EQ(Host::text_at(host.expression(instance, 11, {Param::of(std::int32_t{0})})), "");
+    EXPECT_EQ(Host::text_at(host.expression(instance, 5)), "");
+    host.give_no_result_buffer(false);
+}
+
+// An instance whose reader or indexes could not be had still serves every
+// event, as with the option off, and destruction frees what was had.
+TEST(Creation, WithoutMemoryEveryEventStillWorks) {
+    Host host(Library::linked_in());
+    const auto* allocations = host.library().allocations();
+    ASSERT_NE(allocations, nullptr);
+    const std::size_t live = allocations->live();
+    for (long failing = 0; failing < 5; ++failing) {
+        allocations->fail_after(failing);
+        Instance& instance = host.create(0, 1);
+        allocations->fail_after(-1);
+        host.action(instance, 0, {Param::of(std::int32_t{4})});
+        host.action(instance, 6, {Param::of("x")});
+        EXPECT_EQ(host.condition(instance, 0, {Param::of(std::int32_t{4})}), 1) << failing;
+        EXPECT_EQ(host.expression(instance, 7, {Param::of(std::int32_t{0})}), instance.index(0) != 0 ? 4 : 0);
+        EXPECT_EQ(Host::text_at(host.expression(instance, 5)), "x");
+        const int indexes = (instance.index(0) != 0) + (instance.index(1) != 0) + (instance.index(2) != 0);
+        EXPECT_TRUE(indexes == 0 || indexes == 3) << "all three indexes or none";
+        host.destroy(instance);
+        EXPECT_EQ(allocations->live(), live) << "allocation " << failing << " failing";
+    }
+}
+
+class Files : public HostTest {
+protected:
+    void SetUp() override {
+        std::random_device entropy;
+        do {
+            dir_ = std::filesystem::temp_directory_path() / ("sorvel-files-" + std::to_string(entropy()));
+        } while (!std::filesystem::create_directories(dir_));
+    }
+    void TearDown() override {
+        HostTest::TearDown();
+        std::error_code ignored;
+        std::filesystem::remove_all(dir_, ignored);
+    }
+    std::filesystem::path dir_;
+};
+
+TEST_F(Files, MissingFilesDirectoriesAndShortReads) {
+    const std::string path = (dir_ / "lines.txt").string();
+    std::ofstream(path, std::ios::binary) << "one\r\ntwo\nthree";
+    struct Case {
+        std::string name;
+        std::uint32_t overstated;
+        std::int32_t strings;
+    };
+    for (const Case& c : std::vector<Case>{{(dir_ / "none.txt").string(), 0, 0},
+                                           {dir_.string(), 0, 0},
+                                           {path, 0, 3},
+                                           {path, 5, 3},
+                                           {path, 100000, 3}}) {
+        SCOPED_TRACE(c.name + " overstated by " + std::to_string(c.overstated));
+        Instance& instance = host.create(1, 1);
+        host.overstate_file_size(c.overstated);
+        host.action(instance, 9, {Param::of(c.name), Param::of(std::int32_t{0})});
+        host.overstate_file_size(0);
+        EXPECT_EQ(instance.count(2), c.strings);
+        EXPECT_EQ(host.open_handles(), 0U);
+        if (c.strings == 3) {  // only what the read gave, never bytes beyond it
+            EXPECT_EQ(Host::text_at(host.expression(instance, 11, {Param::of(std::int32_t{2})})), "three");
+        }
+        host.destroy(instance);
+    }
+}
+
+}  // namespace

@@ -1,0 +1,132 @@
+// What the hand-written tests share: holders that own a collection's fields,
+// a shape renderer, scripted draws, chains linked directly in the node
+// layout, and a caller for exports of any argument count.
+#pragma once
+
+#include <array>
+#include <cstdint>
+#include <cstring>
+#include <new>
+#include <string>
+#include <type_traits>
+#include <vector>
+
+#include "collections/collections.hpp"
+#include "collections/random_path.hpp"
+#include "small_stack.hpp"
+#include "test_host.hpp"
+
+namespace sorvel::test {
+
+// Owns what a collection view refers to; frees tree and index at the end.
+template <class V>
+struct Holder {
+    using Node = TreeNode<V>;
+    Node* root = nullptr;
+    std::int32_t count = 0;
+    InsertionIndex<Node>* index = nullptr;
+
+    explicit Holder(bool with_index = false) : index(with_index ? create_index<Node>() : nullptr) {}
+    Holder(const Holder&) = delete;
+    Holder& operator=(const Holder&) = delete;
+    ~Holder() {
+        Collection<V> c = view();
+        clear(c);
+        destroy_index(index);
+    }
+    Collection<V> view() { return Collection<V>{root, count, index}; }
+};
+
+// Preorder with "-" for every empty link, without recursion: equal texts
+// mean equal trees. `children(n)` gives {left, right}, `text(n)` a value.
+template <class Ref, class Children, class Text>
+std::string preorder(Ref root, Ref none, Children children, Text text) {
+    std::string out;
+    std::vector<Ref> pending{root};
+    while (!pending.empty()) {
+        const Ref at = pending.back();
+        pending.pop_back();
+        if (at == none) {
+            out += "- ";
+            continue;
+        }
+        out += text(at) + ' ';
+        const auto [left, right] = children(at);
+        pending.push_back(right);
+        pending.push_back(left);
+    }
+    return out;
+}
+
+template <class V>
+std::string shape(const TreeNode<V>* root) {
+    return preorder(
+        root, static_cast<const TreeNode<V>*>(nullptr),
+        [](auto* n) {
+            return std::pair{n->left, n->right};
+        },
+        [](auto* n) {
+            if constexpr (std::is_same_v<V, char*>) {
+                return std::string(n->value);
+            } else {
+                return std::to_string(n->value);
+            }
+        });
+}
+
+// Draws given in advance, as the core takes them.
+struct ScriptedDraws {
+    std::vector<int> values;
+    std::size_t used = 0;
+    DrawSource source() {
+        return {[](void* self) noexcept {
+                    auto* d = static_cast<ScriptedDraws*>(self);
+                    return d->used < d->values.size() ? d->values[d->used++] : 0;
+                },
+                this};
+    }
+};
+
+// A chain linked directly, in linear time: directions[i] says whether node
+// i + 1 hangs right (1) or left (0) of node i. A node with a right child takes
+// the smallest value left, one with a left child the largest, so the search
+// order holds for any directions. Strings are zero-padded numbers.
+template <class V>
+void link_chain(Holder<V>& h, const std::vector<int>& directions) {
+    using Node = TreeNode<V>;
+    std::int32_t low = 0;
+    auto high = static_cast<std::int32_t>(directions.size() + 2);
+    Node* deepest = nullptr;
+    for (std::size_t i = 0; i <= directions.size(); ++i) {
+        const std::int32_t value = i < directions.size() && directions[i] == 0 ? --high : ++low;
+        Node* node;
+        if constexpr (std::is_same_v<V, char*>) {
+            const std::string digits = std::to_string(value);
+            const std::string text = std::string(10 - digits.size(), '0') + digits;
+            node = new (memory::allocate(sizeof(Node) + text.size() + 1)) Node{};
+            node->value = std::strcpy(reinterpret_cast<char*>(node + 1), text.c_str());
+        } else {
+            node = new (memory::allocate(sizeof(Node))) Node{};
+            node->value = static_cast<V>(value);
+        }
+        (deepest == nullptr ? h.root : (directions[i - 1] != 0 ? deepest->right : deepest->left)) = node;
+        deepest = node;
+        ++h.count;
+    }
+}
+
+// Calls an export with the first `n` of seven words.
+inline testhost::word call_with(const testhost::Library& library, void* function, int n,
+                                const std::array<testhost::word, 7>& w) {
+    switch (n) {
+        case 0: return library.call(function, {});
+        case 1: return library.call(function, {w[0]});
+        case 2: return library.call(function, {w[0], w[1]});
+        case 3: return library.call(function, {w[0], w[1], w[2]});
+        case 4: return library.call(function, {w[0], w[1], w[2], w[3]});
+        case 5: return library.call(function, {w[0], w[1], w[2], w[3], w[4]});
+        default: return library.call(function, {w[0], w[1], w[2], w[3], w[4], w[5], w[6]});
+    }
+}
+
+}  // namespace sorvel::test
