@@ -259,7 +259,11 @@ TEST_F(HostTest, StubsGiveTheirFixedResultsForAnyArguments) {
 }
 
 TEST_F(HostTest, OrdinalsReachTheNamedExports) {
-#if defined(_WIN32)
+#if !defined(_WIN32)
+    if (!host.library().loader_owned()) {
+        GTEST_SKIP() << "ordinals exist in a Windows export table only";
+    }
+#endif
     for (const ExportEntry& e : all_exports()) {
         void* by_name = host.library().symbol(e.name);
         ASSERT_NE(by_name, nullptr) << e.name;
@@ -269,9 +273,6 @@ TEST_F(HostTest, OrdinalsReachTheNamedExports) {
     EXPECT_EQ(host.library().symbol_by_ordinal(1), nullptr);
     EXPECT_EQ(host.library().symbol_by_ordinal(3), nullptr);
     EXPECT_EQ(host.library().symbol_by_ordinal(113), nullptr);
-#else
-    GTEST_SKIP() << "ordinals exist in the Windows export table only";
-#endif
 }
 
 // ------------------------------------------------------------ information block and tables

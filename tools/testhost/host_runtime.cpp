@@ -3,6 +3,7 @@
 // convention, msvcrt's the C one. Windows code calls with the stack aligned
 // to 4 bytes only, so every function realigns it for this program's code.
 #include <asm/ldt.h>
+#include <strings.h>
 #include <sys/syscall.h>
 #include <unistd.h>
 
@@ -12,7 +13,6 @@
 #include <cstdlib>
 #include <cstring>
 #include <stdexcept>
-#include <strings.h>
 
 #include "pe_image.hpp"
 
@@ -38,6 +38,7 @@ constexpr u32 kPage = 0x1000;
 
 // The counting allocator behind the malloc family.
 std::size_t g_live = 0;
+std::uint64_t g_total = 0;
 long g_countdown = -1;
 bool injected_failure() {
     return g_countdown >= 0 && g_countdown-- == 0;
@@ -176,6 +177,7 @@ RUNTIME_CDECL void* malloc(std::size_t bytes) {
     }
     void* block = std::malloc(bytes == 0 ? 1 : bytes);
     g_live += block != nullptr ? 1 : 0;
+    g_total += block != nullptr ? 1 : 0;
     return block;
 }
 RUNTIME_CDECL void* calloc(std::size_t count, std::size_t bytes) {
@@ -203,7 +205,12 @@ RUNTIME_CDECL void* realloc(void* block, std::size_t bytes) {
         free(block);
         return nullptr;
     }
-    return injected_failure() ? nullptr : std::realloc(block, bytes);
+    if (injected_failure()) {
+        return nullptr;
+    }
+    void* moved = std::realloc(block, bytes);
+    g_total += moved != nullptr ? 1 : 0;
+    return moved;
 }
 RUNTIME_CDECL void* memcpy(void* to, const void* from, std::size_t n) {
     return std::memcpy(to, from, n);
@@ -261,30 +268,48 @@ void* import(std::string_view dll, std::string_view name) {
         const char* name;
         void* address;
     };
-#define RUNTIME_ENTRY(dll, name) Entry{#dll ".dll", #name, reinterpret_cast<void*>(&dll::name)}
+#define RUNTIME_ENTRY(dll, name)                                  \
+    Entry {                                                       \
+#dll ".dll", #name, reinterpret_cast < void*>(&dll::name) \
+    }
     static const Entry kEntries[] = {
-        RUNTIME_ENTRY(kernel32, DeleteCriticalSection), RUNTIME_ENTRY(kernel32, EnterCriticalSection),
-        RUNTIME_ENTRY(kernel32, FreeLibrary),           RUNTIME_ENTRY(kernel32, GetLastError),
-        RUNTIME_ENTRY(kernel32, GetModuleHandleA),      RUNTIME_ENTRY(kernel32, GetProcAddress),
-        RUNTIME_ENTRY(kernel32, InitializeCriticalSection), RUNTIME_ENTRY(kernel32, LeaveCriticalSection),
-        RUNTIME_ENTRY(kernel32, LoadLibraryA),          RUNTIME_ENTRY(kernel32, ReadFile),
-        RUNTIME_ENTRY(kernel32, Sleep),                 RUNTIME_ENTRY(kernel32, TlsGetValue),
-        RUNTIME_ENTRY(kernel32, VirtualProtect),        RUNTIME_ENTRY(kernel32, VirtualQuery),
-        RUNTIME_ENTRY(msvcrt, _amsg_exit),              RUNTIME_ENTRY(msvcrt, _initterm),
-        RUNTIME_ENTRY(msvcrt, _lock),                   RUNTIME_ENTRY(msvcrt, _unlock),
-        RUNTIME_ENTRY(msvcrt, abort),                   RUNTIME_ENTRY(msvcrt, calloc),
-        RUNTIME_ENTRY(msvcrt, free),                    RUNTIME_ENTRY(msvcrt, fwrite),
-        RUNTIME_ENTRY(msvcrt, malloc),                  RUNTIME_ENTRY(msvcrt, memcpy),
-        RUNTIME_ENTRY(msvcrt, memmove),                 RUNTIME_ENTRY(msvcrt, memset),
-        RUNTIME_ENTRY(msvcrt, rand),                    RUNTIME_ENTRY(msvcrt, srand),
-        RUNTIME_ENTRY(msvcrt, realloc),                 RUNTIME_ENTRY(msvcrt, strlen),
-        RUNTIME_ENTRY(msvcrt, strncmp),                 RUNTIME_ENTRY(msvcrt, vfprintf),
+        RUNTIME_ENTRY(kernel32, DeleteCriticalSection),
+        RUNTIME_ENTRY(kernel32, EnterCriticalSection),
+        RUNTIME_ENTRY(kernel32, FreeLibrary),
+        RUNTIME_ENTRY(kernel32, GetLastError),
+        RUNTIME_ENTRY(kernel32, GetModuleHandleA),
+        RUNTIME_ENTRY(kernel32, GetProcAddress),
+        RUNTIME_ENTRY(kernel32, InitializeCriticalSection),
+        RUNTIME_ENTRY(kernel32, LeaveCriticalSection),
+        RUNTIME_ENTRY(kernel32, LoadLibraryA),
+        RUNTIME_ENTRY(kernel32, ReadFile),
+        RUNTIME_ENTRY(kernel32, Sleep),
+        RUNTIME_ENTRY(kernel32, TlsGetValue),
+        RUNTIME_ENTRY(kernel32, VirtualProtect),
+        RUNTIME_ENTRY(kernel32, VirtualQuery),
+        RUNTIME_ENTRY(msvcrt, _amsg_exit),
+        RUNTIME_ENTRY(msvcrt, _initterm),
+        RUNTIME_ENTRY(msvcrt, _lock),
+        RUNTIME_ENTRY(msvcrt, _unlock),
+        RUNTIME_ENTRY(msvcrt, abort),
+        RUNTIME_ENTRY(msvcrt, calloc),
+        RUNTIME_ENTRY(msvcrt, free),
+        RUNTIME_ENTRY(msvcrt, fwrite),
+        RUNTIME_ENTRY(msvcrt, malloc),
+        RUNTIME_ENTRY(msvcrt, memcpy),
+        RUNTIME_ENTRY(msvcrt, memmove),
+        RUNTIME_ENTRY(msvcrt, memset),
+        RUNTIME_ENTRY(msvcrt, rand),
+        RUNTIME_ENTRY(msvcrt, srand),
+        RUNTIME_ENTRY(msvcrt, realloc),
+        RUNTIME_ENTRY(msvcrt, strlen),
+        RUNTIME_ENTRY(msvcrt, strncmp),
+        RUNTIME_ENTRY(msvcrt, vfprintf),
         Entry{"msvcrt.dll", "_iob", iob()},
     };
 #undef RUNTIME_ENTRY
     for (const Entry& e : kEntries) {
-        if (name == e.name && dll.size() == std::strlen(e.dll) &&
-            ::strncasecmp(dll.data(), e.dll, dll.size()) == 0) {
+        if (name == e.name && dll.size() == std::strlen(e.dll) && ::strncasecmp(dll.data(), e.dll, dll.size()) == 0) {
             return e.address;
         }
     }
@@ -292,8 +317,8 @@ void* import(std::string_view dll, std::string_view name) {
 }
 
 const Library::Allocations& allocations() {
-    static constexpr Library::Allocations kCounter{
-        [] { return g_live; }, [](long n) { g_countdown = n < 0 ? -1 : n; }};
+    static constexpr Library::Allocations kCounter{[] { return g_live; }, [](long n) { g_countdown = n < 0 ? -1 : n; },
+                                                   [] { return g_total; }};
     return kCounter;
 }
 

@@ -31,7 +31,7 @@ public:
 private:
     struct Exports {
         std::uint32_t ordinal_base = 0;
-        std::vector<std::uint32_t> functions;  // RVAs by ordinal - base; 0: none
+        std::vector<std::uint32_t> functions;                      // RVAs by ordinal - base; 0: none
         std::vector<std::pair<std::string, std::uint32_t>> names;  // name, index into functions
     };
     void map(const std::vector<unsigned char>& file);

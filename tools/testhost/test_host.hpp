@@ -116,6 +116,7 @@ public:
     struct Allocations {
         std::size_t (*live)();
         void (*fail_after)(long n);  // the n-th allocation from now fails; negative: none
+        std::uint64_t (*total)();    // allocations made so far
     };
     const Allocations* allocations() const { return allocations_; }
 
