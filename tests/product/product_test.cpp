@@ -3,6 +3,7 @@
 // msvcrt's, and every allocation of an Add or a Load may fail without a
 // crash, a leak or a half-made change.
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <cstdlib>
@@ -28,6 +29,11 @@ using sorvel::testhost::Library;
 using sorvel::testhost::NodeView;
 using sorvel::testhost::Param;
 using Bytes = std::vector<unsigned char>;
+
+// Unique per process: other builds' tests may run at the same time.
+fs::path temp_file(const std::string& name) {
+    return fs::temp_directory_path() / ("sorvel-" + std::to_string(::getpid()) + "-" + name);
+}
 
 std::string product_path() {
     const char* path = std::getenv("SORVEL_TEST_LIBRARY");
@@ -97,12 +103,11 @@ TEST(ProductDll, BrokenCopiesFailWithAClearMessage) {
          },
          "unsupported relocation type 7"},
     };
-    const auto dir = fs::temp_directory_path();
     for (const BrokenCopy& c : cases) {
         SCOPED_TRACE(c.what);
         Bytes copy = product;
         c.break_it(copy);
-        const fs::path path = dir / "sorvel-broken.dll";
+        const fs::path path = temp_file("broken.dll");
         std::ofstream(path, std::ios::binary)
             .write(reinterpret_cast<const char*>(copy.data()), static_cast<std::streamsize>(copy.size()));
         try {
@@ -197,7 +202,7 @@ TEST(ProductDll, EveryAllocationOfAnAddOrALoadMayFail) {
     const auto library = Library::built();
     const auto* allocations = library->allocations();
     ASSERT_NE(allocations, nullptr);
-    const fs::path file = fs::temp_directory_path() / "sorvel-product-sweep.txt";
+    const fs::path file = temp_file("sweep.txt");
     std::ofstream(file, std::ios::binary) << "delta\nalpha\r\ncharlie\n\nbravo\nalpha\necho";
     constexpr const char* kLoad = "Load From File: %0 into Strings (Balance: %1)";
     const SweepCase cases[] = {
