@@ -15,6 +15,7 @@
 // prints the events of an input as they run.
 #include <unistd.h>
 
+#include <algorithm>
 #include <array>
 #include <bit>
 #include <cstddef>
@@ -192,18 +193,10 @@ public:
     explicit Values(Input& in) : in_(in) {}
 
     std::int32_t integer() {
-        static constexpr std::array<std::int32_t, 12> kEdges = {std::numeric_limits<std::int32_t>::min(),
-                                                                std::numeric_limits<std::int32_t>::max(),
-                                                                0,
-                                                                -1,
-                                                                1,
-                                                                std::numeric_limits<std::int32_t>::min() + 1,
-                                                                std::numeric_limits<std::int32_t>::max() - 1,
-                                                                65535,
-                                                                65536,
-                                                                -65536,
-                                                                32767,
-                                                                32768};
+        using Limit = std::numeric_limits<std::int32_t>;
+        static constexpr std::array<std::int32_t, 12> kEdges = {
+            Limit::min(),     Limit::max(), 0,     -1,     1,     Limit::min() + 1,
+            Limit::max() - 1, 65535,        65536, -65536, 32767, 32768};
         std::int32_t v = 0;
         const std::uint8_t b = in_.byte();
         switch (b % 8) {
@@ -748,59 +741,51 @@ private:
         }
     }
 
-    // Walks both trees side by side; a missing or extra node, or a value
-    // that differs (floats by their bits), is a mismatch.
-    template <class V, class Same, class Show>
-    void walk(word root, const fuzzmodel::Collection<V>& c, const Same& same, const Show& describe, const char* name) {
-        std::vector<std::pair<NodeView, int>> pending{{NodeView{root}, c.root}};
-        std::size_t nodes = 0;
-        while (!pending.empty()) {
-            const NodeView lib = pending.back().first;
-            const int mod = pending.back().second;
-            pending.pop_back();
-            const auto where = [&] { return std::string(name) + " tree, under model node " + std::to_string(mod); };
-            if (static_cast<bool>(lib) != (mod != fuzzmodel::kNone)) {
-                mismatch(where() + ": library has " + (lib ? "a node" : "none") + ", model " +
-                         (mod != fuzzmodel::kNone ? "a node holding " + describe(c.at(mod).value) : "none"));
-            }
-            if (!lib) {
-                continue;
-            }
-            ++nodes;
-            if (!same(lib, c.at(mod).value)) {
-                mismatch(where() + ": value differs, model " + describe(c.at(mod).value));
-            }
-            pending.emplace_back(lib.left(), c.at(mod).left);
-            pending.emplace_back(lib.right(), c.at(mod).right);
-        }
-        if (nodes != static_cast<std::size_t>(c.count)) {
-            mismatch(std::string(name) + " model tree holds " + std::to_string(nodes) + " nodes, count " +
-                     std::to_string(c.count));
-        }
+    // A tree as text, preorder with "-" for every empty link: equal texts
+    // mean equal trees. Floats show their bits, strings their length.
+    static std::string text_of(std::int32_t v) { return std::to_string(v); }
+    static std::string text_of(float v) { return hex32(std::bit_cast<std::uint32_t>(v)); }
+    static std::string text_of(const std::string& v) { return std::to_string(v.size()) + ':' + v; }
+
+    static std::string library_shape(word root, int collection) {
+        return sorvel::test::preorder(
+            NodeView{root}.address, word{0},
+            [](word n) {
+                return std::pair{NodeView{n}.left().address, NodeView{n}.right().address};
+            },
+            [collection](word n) {
+                const NodeView v{n};
+                return collection == kIntegers ? text_of(v.integer())
+                       : collection == kFloats ? text_of(v.floating())
+                                               : text_of(v.string());
+            });
+    }
+
+    template <class V>
+    static std::string model_shape(const fuzzmodel::Collection<V>& c) {
+        return sorvel::test::preorder(
+            c.root, fuzzmodel::kNone,
+            [&c](int n) {
+                return std::pair{c.at(n).left, c.at(n).right};
+            },
+            [&c](int n) { return text_of(c.at(n).value); });
+    }
+
+    static std::string model_shape(const fuzzmodel::Instance& m, int collection) {
+        return collection == kIntegers ? model_shape(m.integers())
+               : collection == kFloats ? model_shape(m.floats())
+                                       : model_shape(m.strings());
     }
 
     void compare_tree(Subject& s, int collection) {
-        const fuzzmodel::Instance& m = *s.model;
-        switch (collection) {
-            case kIntegers:
-                walk(
-                    s.host->root(kIntegers), m.integers(), [](NodeView n, std::int32_t v) { return n.integer() == v; },
-                    [](std::int32_t v) { return std::to_string(v); }, "integer");
-                break;
-            case kFloats:
-                walk(
-                    s.host->root(kFloats), m.floats(),
-                    [](NodeView n, float v) {
-                        return std::bit_cast<std::uint32_t>(n.floating()) == std::bit_cast<std::uint32_t>(v);
-                    },
-                    [](float v) { return show_float(std::bit_cast<std::uint32_t>(v)); }, "float");
-                break;
-            default:
-                walk(
-                    s.host->root(kStrings), m.strings(),
-                    [](NodeView n, const std::string& v) { return n.string() == v; },
-                    [](const std::string& v) { return show(v); }, "string");
-                break;
+        const std::string library = library_shape(s.host->root(collection), collection);
+        const std::string model = model_shape(*s.model, collection);
+        if (library != model) {
+            const std::size_t at = static_cast<std::size_t>(
+                std::mismatch(library.begin(), library.end(), model.begin(), model.end()).first - library.begin());
+            const std::size_t from = at > 40 ? at - 40 : 0;
+            mismatch("collection " + std::to_string(collection) + " trees differ from byte " + std::to_string(at) +
+                     ": library ..." + show(library.substr(from, 120)) + ", model ..." + show(model.substr(from, 120)));
         }
     }
 
@@ -883,68 +868,45 @@ private:
             std::size_t lines;
         };
         std::optional<LoadArguments> load;
+        static constexpr std::array<const char*, 9> kNames = {"Add Integer", "Remove Integer", "Clear Integers",
+                                                              "Add Float",   "Remove Float",   "Clear Floats",
+                                                              "Add String",  "Remove String",  "Clear Strings"};
+        touched = number < 9 ? static_cast<int>(number / 3) : kStrings;
+        const bool adds = number % 3 == 0;
+        std::function<std::string()> value;  // the value's text, for an add or a remove
         switch (number) {
+            case 2:
+            case 5:
+            case 8: s.model->clear(touched); break;
             case 0:
             case 1: {
                 const std::int32_t v = values_.integer();
-                if (number == 0) {
-                    what = [v] { return "Add Integer " + std::to_string(v); };
-                    s.model->add_integer(v);
-                } else {
-                    what = [v] { return "Remove Integer " + std::to_string(v); };
-                    s.model->remove_integer(v);
-                }
+                adds ? s.model->add_integer(v) : s.model->remove_integer(v);
                 params = {Param::of(v)};
                 calls = {event_param(s, 0)};
+                value = [v] { return std::to_string(v); };
                 break;
             }
-            case 2:
-                what = named("Clear Integers");
-                s.model->clear_integers();
-                break;
             case 3:
             case 4: {
                 const std::uint32_t bits = values_.float_bits();
-                const float v = std::bit_cast<float>(bits);
-                if (number == 3) {
-                    what = [bits] { return "Add Float " + show_float(bits); };
-                    s.model->add_float(v);
-                } else {
-                    what = [bits] { return "Remove Float " + show_float(bits); };
-                    s.model->remove_float(v);
-                }
+                adds ? s.model->add_float(std::bit_cast<float>(bits))
+                     : s.model->remove_float(std::bit_cast<float>(bits));
                 params = {float_param(bits)};
                 calls = {event_param(s, 2)};
-                touched = kFloats;
+                value = [bits] { return show_float(bits); };
                 break;
             }
-            case 5:
-                what = named("Clear Floats");
-                s.model->clear_floats();
-                touched = kFloats;
-                break;
             case 6:
             case 7: {
                 const Text t = values_.text();
-                if (number == 6) {
-                    what = [t] { return "Add String " + show(t); };
-                    s.model->add_string(t);
-                } else {
-                    what = [t] { return "Remove String " + show(t); };
-                    s.model->remove_string(t);
-                }
+                adds ? s.model->add_string(t) : s.model->remove_string(t);
                 params = {text_param(t)};
                 calls = {event_param(s, -1)};
-                touched = kStrings;
+                value = [t] { return show(t); };
                 break;
             }
-            case 8:
-                what = named("Clear Strings");
-                s.model->clear_strings();
-                touched = kStrings;
-                break;
             default: {
-                touched = kStrings;
                 const std::uint8_t which = in_.byte() % 8;
                 std::optional<std::string> contents;
                 Text name;
@@ -986,6 +948,9 @@ private:
                 }
                 break;
             }
+        }
+        if (number < 9) {
+            what = [name = kNames[number], value] { return std::string(name) + (value ? " " + value() : ""); };
         }
         if (failing_allocation >= 0) {
             what = [plain = std::move(what), failing_allocation] {
@@ -1050,10 +1015,10 @@ private:
         // Tree and index both: two outcomes can differ in the order of
         // additions alone, which leaves the same tree when the lines do not
         // meet on their way down.
-        const std::string library = library_strings(s.host->root(kStrings)) + '|' + library_index(s);
+        const std::string library = library_shape(s.host->root(kStrings), kStrings) + '|' + library_index(s);
         const auto matches = [&](const fuzzmodel::Instance& m, std::size_t used) {
             return used == made && m.strings_size() == s.host->count(kStrings) &&
-                   model_strings(m) + '|' + model_index(m) == library;
+                   model_shape(m.strings()) + '|' + model_index(m) == library;
         };
         if (matches(*s.model, full_draws)) {
             return full_draws;
@@ -1075,26 +1040,6 @@ private:
             "the strings after a load with a failing allocation match no outcome: neither the full load, "
             "nor none, nor one line left out (library drew " +
             std::to_string(made) + " times, holds " + std::to_string(s.host->count(kStrings)) + " strings)");
-    }
-
-    // Preorder with empty links marked, each string with its length: equal
-    // texts mean equal trees.
-    static std::string library_strings(word root) {
-        std::string out;
-        std::vector<NodeView> pending{NodeView{root}};
-        while (!pending.empty()) {
-            const NodeView n = pending.back();
-            pending.pop_back();
-            if (!n) {
-                out += '-';
-                continue;
-            }
-            const std::string v = n.string();
-            out += std::to_string(v.size()) + ':' + v;
-            pending.push_back(n.right());
-            pending.push_back(n.left());
-        }
-        return out;
     }
 
     // The string index read back through StringElementAt$, each entry with
@@ -1119,24 +1064,6 @@ private:
         for (const int slot : m.strings().index) {
             const std::string& v = m.strings().at(slot).value;
             out += std::to_string(v.size()) + ':' + v;
-        }
-        return out;
-    }
-
-    static std::string model_strings(const fuzzmodel::Instance& m) {
-        const fuzzmodel::Collection<std::string>& c = m.strings();
-        std::string out;
-        std::vector<int> pending{c.root};
-        while (!pending.empty()) {
-            const int at = pending.back();
-            pending.pop_back();
-            if (at == fuzzmodel::kNone) {
-                out += '-';
-                continue;
-            }
-            out += std::to_string(c.at(at).value.size()) + ':' + c.at(at).value;
-            pending.push_back(c.at(at).right);
-            pending.push_back(c.at(at).left);
         }
         return out;
     }

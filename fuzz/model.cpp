@@ -193,6 +193,17 @@ const Node<V>* index_entry(const Collection<V>& c, bool indexed, std::int32_t po
     return &c.at(c.index[static_cast<std::size_t>(position)]);
 }
 
+// The index scanned from position 0 for the first value that matches.
+template <class V, class Match>
+std::int32_t index_scan(const Collection<V>& c, bool indexed, Match match) {
+    for (std::size_t i = 0; indexed && i < c.index.size(); ++i) {
+        if (match(c.at(c.index[i]).value)) {
+            return static_cast<std::int32_t>(i);
+        }
+    }
+    return -1;
+}
+
 template <class V>
 std::size_t tree_height(const Collection<V>& c) {
     std::size_t highest = 0;
@@ -289,10 +300,6 @@ void Instance::add_integer(std::int32_t v) {
 void Instance::remove_integer(std::int32_t v) {
     tree_remove(integers_, v, indexed(), compare_integers);
 }
-void Instance::clear_integers() {
-    tree_clear(integers_);
-}
-
 void Instance::add_float(float v) {
     if (v != v) {
         return;
@@ -305,10 +312,6 @@ void Instance::remove_float(float v) {
         return;
     }
     tree_remove(floats_, v, indexed(), compare_floats);
-}
-
-void Instance::clear_floats() {
-    tree_clear(floats_);
 }
 
 void Instance::add_string(const Text& v) {
@@ -331,8 +334,8 @@ void Instance::remove_string(const Text& v) {
                 [cs](const std::string& a, const std::string& b) { return compare_strings(a, b, cs); });
 }
 
-void Instance::clear_strings() {
-    tree_clear(strings_);
+void Instance::clear(int collection) {
+    collection == 0 ? tree_clear(integers_) : collection == 1 ? tree_clear(floats_) : tree_clear(strings_);
 }
 
 void Instance::load(const std::optional<std::string>& file, std::int32_t balance, Draws& draws,
@@ -376,15 +379,7 @@ std::string Instance::strings_random(Draws& draws) const {
 }
 
 std::int32_t Instance::index_of_integer(std::int32_t v) const {
-    if (!indexed() || integers_.index.empty()) {
-        return -1;
-    }
-    for (std::size_t i = 0; i < integers_.index.size(); ++i) {
-        if (integers_.at(integers_.index[i]).value == v) {
-            return static_cast<std::int32_t>(i);
-        }
-    }
-    return -1;
+    return index_scan(integers_, indexed(), [v](std::int32_t held) { return held == v; });
 }
 
 std::int32_t Instance::integer_at(std::int32_t position) const {
@@ -393,15 +388,8 @@ std::int32_t Instance::integer_at(std::int32_t position) const {
 }
 
 std::int32_t Instance::index_of_float(float v) const {
-    if (!indexed() || floats_.index.empty()) {
-        return -1;
-    }
-    for (std::size_t i = 0; i < floats_.index.size(); ++i) {
-        if (floats_.at(floats_.index[i]).value == v) {  // IEEE equality: never true for a NaN
-            return static_cast<std::int32_t>(i);
-        }
-    }
-    return -1;
+    // IEEE equality: never true for a NaN, and -0.0 finds +0.0.
+    return index_scan(floats_, indexed(), [v](float held) { return held == v; });
 }
 
 float Instance::float_at(std::int32_t position) const {
@@ -411,15 +399,10 @@ float Instance::float_at(std::int32_t position) const {
 
 std::int32_t Instance::index_of_string(const Text& v) const {
     const auto s = c_string(v);
-    if (!s || !indexed() || strings_.index.empty()) {
-        return -1;
-    }
-    for (std::size_t i = 0; i < strings_.index.size(); ++i) {
-        if (compare_strings(strings_.at(strings_.index[i]).value, *s, case_sensitive()) == 0) {
-            return static_cast<std::int32_t>(i);
-        }
-    }
-    return -1;
+    const bool cs = case_sensitive();
+    return s ? index_scan(strings_, indexed(),
+                          [&](const std::string& held) { return compare_strings(held, *s, cs) == 0; })
+             : -1;
 }
 
 std::string Instance::string_at(std::int32_t position) const {

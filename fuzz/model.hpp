@@ -76,13 +76,11 @@ public:
     // Actions.
     void add_integer(std::int32_t v);
     void remove_integer(std::int32_t v);
-    void clear_integers();
     void add_float(float v);
     void remove_float(float v);
-    void clear_floats();
     void add_string(const Text& v);
     void remove_string(const Text& v);
-    void clear_strings();
+    void clear(int collection);  // 0 integers, 1 floats, 2 strings
     // `file` is the file's bytes, or nullopt when it cannot be opened.
     // `left_out`: the number (from 0) of a line whose add is left out, as
     // when memory runs out for that one line.

@@ -4,6 +4,7 @@
 
 #include <filesystem>
 #include <fstream>
+#include <random>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -27,7 +28,9 @@ struct Case {
 };
 
 TEST(SorvelHost, ScriptsPrintOutcomesResultsAndFaults) {
-    const auto dot = std::filesystem::temp_directory_path() / "sorvel-host-test.dot";
+    // Its own name: other builds' tests may run at the same time.
+    const auto dot = std::filesystem::temp_directory_path() /
+                     ("sorvel-host-test-" + std::to_string(std::random_device{}()) + ".dot");
     std::string chain;
     for (int v = 0; v < 2000; ++v) {
         chain += "Add Integer " + std::to_string(v) + "\n";

@@ -41,6 +41,9 @@ const char kUsage[] =
     "Random picks and balanced loads draw from the C runtime's rand, which the\n"
     "library never seeds. The same --seed repeats them on the same platform;\n"
     "other runtimes (glibc, msvcrt) give other sequences for the same seed.\n"
+    "The 32-bit x86 Linux build also runs the Windows DLL itself (--library\n"
+    "sorvel.dll, under qemu-i386) with msvcrt's generator, so it draws what\n"
+    "Windows would.\n"
     "\n"
     "Script lines: an event by its display string with the values in place\n"
     "(Add Integer: 5) or by the words before its first value (Add Integer 5);\n"
@@ -116,7 +119,7 @@ int main(int argc, char** argv) {
                                             : sorvel::testhost::Library::load(library_path);
         sorvel::testhost::Host host(library);
         if (seed >= 0) {
-            std::srand(static_cast<unsigned>(seed));
+            library->seed_rand(static_cast<unsigned>(seed));
         }
         int status = 0;
         {

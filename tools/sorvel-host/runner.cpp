@@ -215,7 +215,7 @@ bool Runner::execute(const std::string& line, const std::string& where) {
             current_ = static_cast<std::size_t>(c.number - 1);
             break;
         case Command::Type::tree: print_tree(c.collection, c.dot_file); break;
-        case Command::Type::seed: std::srand(static_cast<unsigned>(c.number)); break;
+        case Command::Type::seed: host_.library().seed_rand(static_cast<unsigned>(c.number)); break;
         case Command::Type::events:
             for (const catalogue::Event& e : catalogue::kEvents) {
                 static const char* const kinds[] = {"condition", "action", "expression"};

@@ -20,7 +20,8 @@ extern "C" word SORVEL_CALL DllMain(word, word, word);
 namespace sorvel::testhost {
 
 std::shared_ptr<Library> Library::linked_in() {
-    static constexpr Allocations kOwnCounter{&memory::live_allocations, &memory::fail_allocation_after};
+    static constexpr Allocations kOwnCounter{&memory::live_allocations, &memory::fail_allocation_after,
+                                             &memory::total_allocations};
     std::shared_ptr<Library> library(new Library());
     library->allocations_ = &kOwnCounter;
 #define TESTHOST_ENTRY(name, ordinal, ...) library->symbols_.push_back(Symbol{#name, reinterpret_cast<void*>(&name)});

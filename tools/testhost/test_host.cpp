@@ -6,6 +6,8 @@
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
+#include <fstream>
+#include <iterator>
 #include <limits>
 #include <stdexcept>
 
@@ -27,11 +29,13 @@
 #include <unistd.h>
 #endif
 
-// Host routines use the library's calling convention: stdcall on 32-bit x86,
-// where the callee removes its arguments.
-#define TESTHOST_CALL SORVEL_CALL
-
 #if defined(__i386__) && !defined(_WIN32)
+#include "pe_image.hpp"
+// Host routines use the library's calling convention: stdcall on 32-bit x86,
+// where the callee removes its arguments. A Windows DLL calls them with the
+// stack aligned to 4 bytes only, so they realign it.
+#define TESTHOST_CALL __attribute__((stdcall, force_align_arg_pointer))
+#define TESTHOST_MAPS_DLLS 1
 // stdcall_check_i386.S: calls fn with count words pushed right to left and
 // stores in *delta how far the stack pointer moved across the call (0 when
 // the callee removed exactly its arguments). The stack is restored either way.
@@ -39,6 +43,8 @@ extern "C" sorvel::testhost::word sorvel_testhost_stdcall_call(void* fn, const s
                                                                sorvel::testhost::word count,
                                                                sorvel::testhost::word* delta);
 #define TESTHOST_CHECKED_CALLS 1
+#else
+#define TESTHOST_CALL SORVEL_CALL
 #endif
 
 namespace sorvel::testhost {
@@ -86,6 +92,27 @@ word float_word(float value) {
 
 std::shared_ptr<Library> Library::load(const std::string& path) {
     std::shared_ptr<Library> library(new Library());
+#if !defined(_WIN32)
+    std::ifstream in(path, std::ios::binary);
+    char signature[2] = {};
+    if (in.read(signature, 2) && signature[0] == 'M' && signature[1] == 'Z') {
+#if defined(TESTHOST_MAPS_DLLS)
+        in.seekg(0);
+        std::vector<unsigned char> file{std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
+        library->image_ = std::make_shared<PeImage>(path, std::move(file));
+        library->handle_ = reinterpret_cast<void*>(library->image_->base());
+        library->loader_owned_ = true;
+        library->allocations_ = &runtime::allocations();
+        if (library->symbol("GetRunObjectInfos") == nullptr) {
+            throw std::runtime_error(path + " exports no GetRunObjectInfos");
+        }
+        return library;
+#else
+        throw std::runtime_error("cannot load " + path +
+                                 ": a Windows DLL runs only in the 32-bit x86 Linux test host (the i386 build)");
+#endif
+    }
+#endif
 #if defined(_WIN32)
     HMODULE module = LoadLibraryA(path.c_str());
     if (module == nullptr) {
@@ -111,14 +138,15 @@ std::shared_ptr<Library> Library::load(const std::string& path) {
 std::shared_ptr<Library> Library::built() {
     // Loaded once and never unloaded: every test of a program talks to the
     // same library, as a host would during one run.
-    static const auto* library = new std::shared_ptr<Library>(
+    static const auto* library = new std::shared_ptr<Library>([] {
+        const char* chosen = std::getenv("SORVEL_TEST_LIBRARY");
 #if defined(_WIN32)
         // By name through the loader's search: the DLL sits next to the program.
-        load("sorvel.dll")
+        return load(chosen != nullptr ? chosen : "sorvel.dll");
 #else
-        load(SORVEL_LIBRARY_DIR "/" SORVEL_LIBRARY_FILE)
+        return load(chosen != nullptr ? chosen : SORVEL_LIBRARY_DIR "/" SORVEL_LIBRARY_FILE);
 #endif
-    );
+    }());
     return *library;
 }
 
@@ -134,6 +162,11 @@ Library::~Library() {
 }
 
 void* Library::symbol(const char* name) const {
+#if defined(TESTHOST_MAPS_DLLS)
+    if (image_) {
+        return image_->symbol(name);
+    }
+#endif
     if (!symbols_.empty()) {
         for (const Symbol& s : symbols_) {
             if (std::strcmp(s.name, name) == 0) {
@@ -153,6 +186,11 @@ void* Library::symbol(const char* name) const {
 }
 
 void* Library::symbol_by_ordinal(int ordinal) const {
+#if defined(TESTHOST_MAPS_DLLS)
+    if (image_) {
+        return image_->symbol_by_ordinal(ordinal);
+    }
+#endif
 #if defined(_WIN32)
     if (handle_ == nullptr || ordinal <= 0 || ordinal > 0xFFFF) {
         return nullptr;
@@ -169,7 +207,22 @@ word Library::module_handle() const {
     return reinterpret_cast<word>(handle_);
 }
 
+void Library::seed_rand(unsigned seed) const {
+#if defined(TESTHOST_MAPS_DLLS)
+    if (image_) {
+        runtime::generator() = seed;
+        return;
+    }
+#endif
+    std::srand(seed);
+}
+
 void* Library::entry_point() const {
+#if defined(TESTHOST_MAPS_DLLS)
+    if (image_) {
+        return image_->entry_point();
+    }
+#endif
 #if defined(_WIN32)
     if (loader_owned_) {
         // The module's entry point from its PE headers: the runtime library's

@@ -69,15 +69,19 @@ struct RecordLayout {
     static constexpr std::size_t kCloseFile = 81;
 };
 
+class PeImage;
+
 // The loaded library and its exports.
 class Library {
 public:
-    // Loads by path (dlopen, or LoadLibrary on Windows). Throws
+    // Loads by path: dlopen, or LoadLibrary on Windows. A Windows DLL ("MZ")
+    // is mapped by the test host itself on 32-bit x86 Linux (PeImage). Throws
     // std::runtime_error when the library or an export cannot be found.
     static std::shared_ptr<Library> load(const std::string& path);
     // The library linked into this program (tests that need its allocator).
     static std::shared_ptr<Library> linked_in();
-    // The default built library next to the test programs.
+    // The library named by SORVEL_TEST_LIBRARY, else the one built next to
+    // the test programs.
     static std::shared_ptr<Library> built();
 
     ~Library();
@@ -85,8 +89,11 @@ public:
     Library& operator=(const Library&) = delete;
 
     void* symbol(const char* name) const;        // null when absent
-    void* symbol_by_ordinal(int ordinal) const;  // Windows only; null elsewhere
+    void* symbol_by_ordinal(int ordinal) const;  // Windows DLLs only; null elsewhere
     word module_handle() const;
+    // Seeds the C runtime generator the library draws from: the host's own
+    // msvcrt one for a mapped image, the system's otherwise.
+    void seed_rand(unsigned seed) const;
 
     // What the loader calls: DllMain itself where the test host plays the
     // loader (ELF, linked in), the module's entry point on Windows, where the
@@ -109,6 +116,7 @@ public:
     struct Allocations {
         std::size_t (*live)();
         void (*fail_after)(long n);  // the n-th allocation from now fails; negative: none
+        std::uint64_t (*total)();    // allocations made so far
     };
     const Allocations* allocations() const { return allocations_; }
 
@@ -123,6 +131,7 @@ private:
     bool loader_owned_ = false;
     const Allocations* allocations_ = nullptr;
     std::vector<Symbol> symbols_;  // linked in: the program's own table
+    std::shared_ptr<PeImage> image_;  // a DLL the test host mapped itself
 };
 
 // A parameter value the host gives for the next parameter request.
