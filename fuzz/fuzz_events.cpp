@@ -22,9 +22,9 @@
 #include <cstdint>
 #include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <functional>
 #include <limits>
 #include <memory>
 #include <optional>
@@ -64,7 +64,7 @@ constexpr std::size_t kHistory = 40;
 constexpr std::size_t kSweepFull = 24;  // larger collections are sampled
 constexpr std::size_t kMaxSweeps = 2;   // per input, besides the final one
 constexpr std::size_t kMaxFailingLoadLines = 100;
-constexpr std::size_t kTreeEvery = 8;  // events between whole-tree comparisons
+constexpr std::size_t kTreeEvery = 32;  // events between whole-tree comparisons
 
 constexpr std::uint16_t kFloatFlag = 0x4000;
 constexpr std::uint16_t kStringFlag = 0x8000;
@@ -78,18 +78,22 @@ constexpr std::array<std::int32_t, 4> kOptionWords = {-1, 0, 1, 2};
 
 // ------------------------------------------------------------ reporting
 
-// The recent events, described only when a difference is found: building
-// the texts for every event would cost more than running the events.
+// The recent events, kept as values and put into words only when a
+// difference is found: building texts for every event would cost more than
+// running the events.
 struct Described {
+    const char* name = "";
+    std::optional<std::int64_t> integer;  // an integer parameter or position
+    std::optional<std::uint32_t> bits;    // a float parameter
+    std::optional<Text> text;             // a string parameter, or a file's first bytes
+    std::string detail;                   // more, for the rare events that have it
+    std::optional<std::int32_t> param_word;
+    long failing = -1;  // the allocation made to fail
     std::size_t number = 0;
     int instance = 0;
     std::int32_t case_word = 0;
     std::int32_t index_word = 0;
-    std::function<std::string()> what;
-    std::string text() const {
-        return "#" + std::to_string(number) + " instance " + std::to_string(instance) + " (case " +
-               std::to_string(case_word) + ", index " + std::to_string(index_word) + "): " + what();
-    }
+    std::string line() const;
 };
 std::array<Described, kHistory> g_history;
 std::size_t g_events = 0;  // described so far in this input
@@ -126,15 +130,26 @@ std::string show_float(std::uint32_t bits) {
     return text;
 }
 
+std::string Described::line() const {
+    std::string out = "#" + std::to_string(number) + " instance " + std::to_string(instance) + " (case " +
+                      std::to_string(case_word) + ", index " + std::to_string(index_word) + "): " + name;
+    out += integer ? " " + std::to_string(*integer) : "";
+    out += bits ? " " + show_float(*bits) : "";
+    out += text ? " " + show(*text) : "";
+    out += detail.empty() ? "" : " " + detail;
+    out += param_word ? " word " + hex32(static_cast<std::uint32_t>(*param_word)) : "";
+    return out + (failing >= 0 ? ", allocation " + std::to_string(failing) + " failing" : "");
+}
+
 [[noreturn]] void mismatch(const std::string& what) {
     std::fprintf(stderr, "\n=== sorvel differential fuzzer: MISMATCH\n");
     if (g_events > 0) {
-        std::fprintf(stderr, "event: %s\n", g_history[(g_events - 1) % kHistory].text().c_str());
+        std::fprintf(stderr, "event: %s\n", g_history[(g_events - 1) % kHistory].line().c_str());
     }
     std::fprintf(stderr, "what:  %s\n", what.c_str());
     std::fprintf(stderr, "recent events (oldest first):\n");
     for (std::size_t i = g_events > kHistory ? g_events - kHistory : 0; i < g_events; ++i) {
-        std::fprintf(stderr, "  %s\n", g_history[i % kHistory].text().c_str());
+        std::fprintf(stderr, "  %s\n", g_history[i % kHistory].line().c_str());
     }
     std::fflush(stderr);
     std::abort();
@@ -350,7 +365,7 @@ public:
     // every way, with blank lines, zero bytes and stray bytes between them.
     std::string file() {
         const std::uint8_t shape = in_.byte();
-        if (shape >= 224 && many_lines_left_ >= kMinManyLines) {
+        if (shape >= 240 && many_lines_left_ >= kMinManyLines) {
             return many_lines();
         }
         const std::size_t target = shape % kMaxFileBytes;
@@ -469,9 +484,13 @@ std::filesystem::path file_folder() {
                                                             : std::filesystem::temp_directory_path();
 }
 
+// Written for every load and removed when the process ends.
 const std::string& file_path() {
-    static const std::string path = (file_folder() / ("sorvel-fuzz-" + std::to_string(::getpid()) + ".txt")).string();
-    return path;
+    static const struct File {
+        std::string path = (file_folder() / ("sorvel-fuzz-" + std::to_string(::getpid()) + ".txt")).string();
+        ~File() { std::remove(path.c_str()); }
+    } file;
+    return file.path;
 }
 
 const std::string& missing_path() {
@@ -481,10 +500,10 @@ const std::string& missing_path() {
 }
 
 void write_file(const std::string& bytes) {
-    std::ofstream out(file_path(), std::ios::binary | std::ios::trunc);
-    out.write(bytes.data(), static_cast<std::streamsize>(bytes.size()));
-    out.close();
-    if (!out) {
+    static std::FILE* const file = std::fopen(file_path().c_str(), "wb");  // kept open: a load is frequent
+    if (file == nullptr || std::fseek(file, 0, SEEK_SET) != 0 ||
+        std::fwrite(bytes.data(), 1, bytes.size(), file) != bytes.size() || std::fflush(file) != 0 ||
+        ::ftruncate(::fileno(file), static_cast<off_t>(bytes.size())) != 0) {
         std::fprintf(stderr, "fuzzer: cannot write %s\n", file_path().c_str());
         std::abort();
     }
@@ -513,7 +532,8 @@ Param text_param(const Text& t) {
 // checked (pointers the library takes from the host).
 struct ExpectedCall {
     Routine routine;
-    std::vector<std::optional<word>> args;
+    std::array<std::optional<word>, 3> args;
+    std::size_t count() const { return routine == Routine::close_file ? 1 : 3; }
 };
 
 const char* routine_name(Routine r) {
@@ -554,7 +574,7 @@ public:
             sweep(s);
         }
         for (Subject& s : subjects_) {
-            begin(s, named("DestroyRunObject"));
+            begin(s, {.name = "DestroyRunObject"});
             host_.destroy(*s.host);
         }
         // Every node, string, index and reader the instances had is freed.
@@ -598,17 +618,16 @@ private:
         expect_equal(host_.calls().size(), std::size_t{0}, "host calls made by exports");
     }
 
-    // `what` describes the event; it runs only when the event is shown.
-    void begin(const Subject& s, std::function<std::string()> what) {
+    void begin(const Subject& s, Described what) {
+        what.number = event_number_;
+        what.instance = s.number;
+        what.case_word = s.model->case_word();
+        what.index_word = s.model->index_word();
         Described& d = g_history[g_events++ % kHistory];
-        d = {event_number_, s.number, s.model->case_word(), s.model->index_word(), std::move(what)};
+        d = std::move(what);
         if (g_trace) {
-            std::fprintf(stderr, "%s\n", d.text().c_str());
+            std::fprintf(stderr, "%s\n", d.line().c_str());
         }
-    }
-
-    static std::function<std::string()> named(const char* what) {
-        return [what] { return std::string(what); };
     }
 
     void create(Subject& s, int number) {
@@ -619,7 +638,7 @@ private:
         const auto creation12 = static_cast<std::int32_t>(static_cast<std::uint32_t>(options) * 0x91000193U);
         s.number = number;
         s.model = std::make_unique<fuzzmodel::Instance>(case_word, index_word);
-        begin(s, named("CreateRunObject"));
+        begin(s, {.name = "CreateRunObject"});
         s.host = &host_.create(case_word, index_word, creation8, creation12);
         Instance& h = *s.host;
         expect_equal(h.i32(RecordLayout::kCaseSensitive), case_word, "case-sensitive flag as stored");
@@ -647,14 +666,17 @@ private:
     // The library writes no header byte besides the two creation words and
     // the result flags, and keeps its own fields that never change.
     void check_header(const Subject& s) {
-        const unsigned char* r = s.host->record();
-        for (std::size_t b = 0; b < RecordLayout::kReader; ++b) {
-            const bool own = (b >= RecordLayout::kHeaderPointer && b < RecordLayout::kHeaderPointer + sizeof(word)) ||
-                             (b >= RecordLayout::kCreationWordA && b < RecordLayout::kCreationWordA + 4) ||
-                             (b >= RecordLayout::kCreationWordB && b < RecordLayout::kCreationWordB + 4) ||
-                             (b >= RecordLayout::kResultFlags && b < RecordLayout::kResultFlags + 2);
-            if (!own && r[b] != 0) {
-                mismatch("header byte " + std::to_string(b) + " written: " + std::to_string(r[b]));
+        // The stretches between the library's own fields, all still zero.
+        static constexpr std::array<std::pair<std::size_t, std::size_t>, 5> kUntouched{
+            {{0, RecordLayout::kHeaderPointer},
+             {RecordLayout::kHeaderPointer + sizeof(word), RecordLayout::kCreationWordA},
+             {RecordLayout::kCreationWordA + 4, RecordLayout::kCreationWordB},
+             {RecordLayout::kCreationWordB + 4, RecordLayout::kResultFlags},
+             {RecordLayout::kResultFlags + 2, RecordLayout::kReader}}};
+        static constexpr std::array<unsigned char, RecordLayout::kReader> kZeros{};
+        for (const auto& [from, to] : kUntouched) {
+            if (std::memcmp(s.host->record() + from, kZeros.data(), to - from) != 0) {
+                mismatch("a header byte from " + std::to_string(from) + " to " + std::to_string(to) + " was written");
             }
         }
         expect_equal(s.host->pointer(RecordLayout::kReader), s.reader, "ParamReader pointer");
@@ -683,7 +705,7 @@ private:
                      " expected; made:" + listing());
         }
         for (std::size_t i = 0; i < got.size(); ++i) {
-            if (got[i].routine != expected[i].routine || got[i].args.size() != expected[i].args.size()) {
+            if (got[i].routine != expected[i].routine || got[i].args.size() != expected[i].count()) {
                 mismatch("host call " + std::to_string(i) + " is " + routine_name(got[i].routine) + ", expected " +
                          routine_name(expected[i].routine) + "; made:" + listing());
             }
@@ -777,9 +799,43 @@ private:
                                        : model_shape(m.strings());
     }
 
+    // Walks both trees side by side; only when they differ are they put
+    // into words, to show where.
+    template <class V, class Same>
+    static bool same_tree(word root, const fuzzmodel::Collection<V>& c, Same same) {
+        std::vector<std::pair<word, int>> pending{{root, c.root}};
+        while (!pending.empty()) {
+            const auto [lib, mod] = pending.back();
+            pending.pop_back();
+            if ((lib == 0) != (mod == fuzzmodel::kNone)) {
+                return false;
+            }
+            if (lib != 0) {
+                const NodeView n{lib};
+                if (!same(n, c.at(mod).value)) {
+                    return false;
+                }
+                pending.emplace_back(n.left().address, c.at(mod).left);
+                pending.emplace_back(n.right().address, c.at(mod).right);
+            }
+        }
+        return true;
+    }
+
     void compare_tree(Subject& s, int collection) {
-        const std::string library = library_shape(s.host->root(collection), collection);
-        const std::string model = model_shape(*s.model, collection);
+        const fuzzmodel::Instance& m = *s.model;
+        const word root = s.host->root(collection);
+        const bool same =
+            collection == kIntegers
+                ? same_tree(root, m.integers(), [](NodeView n, std::int32_t v) { return n.integer() == v; })
+            : collection == kFloats
+                ? same_tree(root, m.floats(),
+                            [](NodeView n, float v) {
+                                return std::bit_cast<std::uint32_t>(n.floating()) == std::bit_cast<std::uint32_t>(v);
+                            })
+                : same_tree(root, m.strings(), [](NodeView n, const std::string& v) { return n.string() == v; });
+        const std::string library = same ? std::string() : library_shape(root, collection);
+        const std::string model = same ? std::string() : model_shape(m, collection);
         if (library != model) {
             const std::size_t at = static_cast<std::size_t>(
                 std::mismatch(library.begin(), library.end(), model.begin(), model.end()).first - library.begin());
@@ -810,14 +866,14 @@ private:
         bool want = false;
         Param p;
         ExpectedCall call;
-        std::function<std::string()> what;
+        Described what;
         switch (number) {
             case 0: {
                 const std::int32_t v = values_.integer();
                 want = s.model->contains_integer(v);
                 p = Param::of(v);
                 call = event_param(s, 0);
-                what = [v] { return "Contains Integer " + std::to_string(v); };
+                what = {.name = "Contains Integer", .integer = v};
                 break;
             }
             case 1: {
@@ -825,7 +881,7 @@ private:
                 want = s.model->contains_float(std::bit_cast<float>(bits));
                 p = float_param(bits);
                 call = event_param(s, 2);
-                what = [bits] { return "Contains Float " + show_float(bits); };
+                what = {.name = "Contains Float", .bits = bits};
                 break;
             }
             default: {
@@ -833,15 +889,17 @@ private:
                 want = s.model->contains_string(t);
                 p = text_param(t);
                 call = event_param(s, -1);
-                what = [t] { return "Contains String " + show(t); };
+                what = {.name = "Contains String", .text = t};
                 break;
             }
         }
         begin(s, std::move(what));
         const std::uint16_t flags = prepare(s, {});
-        const word got = host_.condition(*s.host, number, {p});
+        params_.assign(1, p);
+        const word got = host_.condition(*s.host, number, params_);
         expect_equal(got, static_cast<word>(want ? 1 : 0), "condition result");
-        check_calls({call});
+        calls_.assign(1, call);
+        check_calls(calls_);
         finish(s, flags, 0, 0, -1);
     }
 
@@ -855,10 +913,12 @@ private:
         if (failing_allocation >= 0) {
             before.emplace(*s.model);
         }
-        std::vector<Param> params;
-        std::vector<ExpectedCall> calls;
+        std::vector<Param>& params = params_;
+        std::vector<ExpectedCall>& calls = calls_;
+        params.clear();
+        calls.clear();
         std::vector<int> script;
-        std::function<std::string()> what;
+        Described what;
         int touched = kIntegers;
         fuzzmodel::Draws model_draws({});
         std::optional<bool> opens;  // for Load From File: whether the file opens
@@ -873,7 +933,6 @@ private:
                                                               "Add String",  "Remove String",  "Clear Strings"};
         touched = number < 9 ? static_cast<int>(number / 3) : kStrings;
         const bool adds = number % 3 == 0;
-        std::function<std::string()> value;  // the value's text, for an add or a remove
         switch (number) {
             case 2:
             case 5:
@@ -884,7 +943,7 @@ private:
                 adds ? s.model->add_integer(v) : s.model->remove_integer(v);
                 params = {Param::of(v)};
                 calls = {event_param(s, 0)};
-                value = [v] { return std::to_string(v); };
+                what.integer = v;
                 break;
             }
             case 3:
@@ -894,7 +953,7 @@ private:
                      : s.model->remove_float(std::bit_cast<float>(bits));
                 params = {float_param(bits)};
                 calls = {event_param(s, 2)};
-                value = [bits] { return show_float(bits); };
+                what.bits = bits;
                 break;
             }
             case 6:
@@ -903,7 +962,7 @@ private:
                 adds ? s.model->add_string(t) : s.model->remove_string(t);
                 params = {text_param(t)};
                 calls = {event_param(s, -1)};
-                value = [t] { return show(t); };
+                what.text = t;
                 break;
             }
             default: {
@@ -929,15 +988,12 @@ private:
                     before.reset();
                 }
                 load = LoadArguments{contents, balance, lines};
-                const std::size_t size = contents ? contents->size() : 0;
-                what = [head = contents ? Text(contents->substr(0, 96)) : name, size, lines, balance,
-                        file = contents.has_value()] {
-                    return "Load From File " +
-                           (file ? "file of " + std::to_string(size) + " bytes, " + std::to_string(lines) +
-                                       " lines: " + show(head) + (size > 96 ? "..." : "")
-                                 : show(head)) +
-                           " balance " + std::to_string(balance);
-                };
+                what = {.name = "Load From File",
+                        .integer = balance,
+                        .text = contents ? Text(contents->substr(0, 96)) : name,
+                        .detail = contents ? "(" + std::to_string(contents->size()) + " bytes, " +
+                                                 std::to_string(lines) + " lines)"
+                                           : ""};
                 params = {text_param(name), Param::of(balance)};
                 calls = {event_param(s, -1), event_param(s, 0)};
                 if (name) {
@@ -949,26 +1005,16 @@ private:
                 break;
             }
         }
-        if (number < 9) {
-            what = [name = kNames[number], value] { return std::string(name) + (value ? " " + value() : ""); };
-        }
-        if (failing_allocation >= 0) {
-            what = [plain = std::move(what), failing_allocation] {
-                return plain() + ", allocation " + std::to_string(failing_allocation) + " failing";
-            };
-        }
+        what.name = number < 9 ? kNames[number] : what.name;
+        what.failing = failing_allocation;
         begin(s, std::move(what));
         const std::uint16_t flags = prepare(s, script);
         if (failing_allocation >= 0) {
             allocations_->fail_after(failing_allocation);
         }
-        const word got = host_.action(*s.host, number, std::move(params));
+        const word got = host_.action(*s.host, number, params);
         if (failing_allocation >= 0) {
             allocations_->fail_after(-1);
-        }
-        if (opens.value_or(false)) {
-            // libFuzzer may end the process without running exit handlers.
-            std::remove(file_path().c_str());
         }
         expect_equal(got, word{0}, "action result");
         check_calls(calls);
@@ -1075,8 +1121,10 @@ private:
                     std::int32_t param_word, const std::vector<int>& script) {
         const fuzzmodel::Instance& m = *s.model;
         fuzzmodel::Draws model_draws(script);
-        std::vector<Param> params;
-        std::vector<ExpectedCall> calls;
+        std::vector<Param>& params = params_;
+        std::vector<ExpectedCall>& calls = calls_;
+        params.clear();
+        calls.clear();
         if (integer_param) {
             params.push_back(Param::of(*integer_param));
             calls.push_back(expr_param(s, 0, param_word));
@@ -1087,17 +1135,11 @@ private:
             params.push_back(text_param(*text_param_value));
             calls.push_back(expr_param(s, 1, param_word));
         }
-        begin(s, [number, integer_param, float_param_bits, text_param_value, param_word] {
-            std::string what = kExpressionNames[number];
-            if (integer_param) {
-                what += std::to_string(*integer_param);
-            } else if (float_param_bits) {
-                what += show_float(*float_param_bits);
-            } else if (text_param_value) {
-                what += show(*text_param_value);
-            }
-            return what + ") word " + hex32(static_cast<std::uint32_t>(param_word));
-        });
+        begin(s, {.name = kExpressionNames[number],
+                  .integer = integer_param,
+                  .bits = float_param_bits,
+                  .text = text_param_value,
+                  .param_word = param_word});
 
         enum class Result { integer, floating, text };
         Result kind = Result::integer;
@@ -1135,7 +1177,7 @@ private:
         }
 
         const std::uint16_t flags = prepare(s, script);
-        const word got = host_.expression(*s.host, number, std::move(params), static_cast<word>(param_word));
+        const word got = host_.expression(*s.host, number, params, static_cast<word>(param_word));
         check_calls(calls);
         const auto low = static_cast<std::uint32_t>(static_cast<std::uintptr_t>(got));
         switch (kind) {
@@ -1238,7 +1280,7 @@ private:
             for (int c = 0; c < 3; ++c) {
                 compare_tree(s, c);
             }
-            begin(s, named("DestroyRunObject, then a new instance in its place"));
+            begin(s, {.name = "DestroyRunObject, then a new instance in its place"});
             host_.destroy(*s.host);
             create(s, s.number);
         } else if (kind == 25 || kind == 27) {
@@ -1278,6 +1320,9 @@ private:
     std::size_t event_number_ = 0;
     std::size_t handler_calls_ = 0;
     const Library::Allocations* allocations_;  // null: no failure can be injected
+    // Reused from call to call, so that an event allocates nothing of its own.
+    std::vector<Param> params_;
+    std::vector<ExpectedCall> calls_;
     std::size_t live_at_start_ = 0;
     std::size_t sweeps_ = 0;
 };
@@ -1299,7 +1344,7 @@ extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size
     // Nothing of this input may stay allocated, or libFuzzer runs it again
     // to look for a leak.
     for (Described& d : g_history) {
-        d.what = nullptr;
+        d = {};
     }
     return 0;
 }

@@ -23,7 +23,6 @@
 #include <cstddef>
 #include <cstdint>
 #include <cstdlib>
-#include <deque>
 #include <stdexcept>
 #include <string>
 #include <vector>
@@ -50,8 +49,10 @@ constexpr std::uint64_t state_for(unsigned seed) {
     return 0x9E3779B97F4A7C15ULL ^ (static_cast<std::uint64_t>(seed) << 1U);
 }
 
-// Draws come from the script first, then from the generator.
-std::deque<int> g_script;
+// Draws come from the script first, then from the generator. The script
+// keeps its storage from one call to the next: no draw allocates.
+std::vector<int> g_script;
+std::size_t g_scripted = 0;  // values of the script already drawn
 std::uint64_t g_state = state_for(1);
 std::size_t g_made = 0;
 
@@ -65,6 +66,7 @@ int generate(std::uint64_t& state) {
 
 std::vector<int> reseed(unsigned seed, std::size_t n) {
     g_script.clear();
+    g_scripted = 0;
     g_state = state_for(seed);
     g_made = 0;
     std::vector<int> values(n);
@@ -91,6 +93,7 @@ bool scriptable() {
 
 void script(std::vector<int> values) {
     g_script.assign(values.begin(), values.end());
+    g_scripted = 0;
     g_made = 0;
 }
 
@@ -100,10 +103,8 @@ std::size_t made() {
 
 int next_value() {
     ++g_made;
-    if (!g_script.empty()) {
-        const int value = g_script.front();
-        g_script.pop_front();
-        return value;
+    if (g_scripted < g_script.size()) {
+        return g_script[g_scripted++];
     }
 #if defined(DRAWS_FOR_IMAGES)
     if (runtime::images() != 0) {

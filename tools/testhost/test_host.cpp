@@ -430,7 +430,7 @@ struct Routines {
     }
 
     static word record(HostCall::Routine routine, std::initializer_list<word> args, word result) {
-        host().calls_.push_back(HostCall{routine, std::vector<word>(args), result});
+        host().calls_.push_back(HostCall{routine, HostCall::Args(args), result});
         return result;
     }
 
@@ -446,12 +446,11 @@ struct Routines {
     // converts an expression's value; raw words pass as they are.
     static word serve(word form) {
         Host& h = host();
-        if (h.params_.empty()) {
+        if (h.next_param_ == h.params_.size()) {
             ++h.missing_params_;
             return 0;
         }
-        Param p = std::move(h.params_.front());
-        h.params_.pop_front();
+        const Param& p = h.params_[h.next_param_++];
         if (p.kind == Param::Kind::raw) {
             return p.raw;
         }
@@ -714,33 +713,36 @@ word Host::call_handler(word handler, Instance& instance, std::initializer_list<
     return result;
 }
 
-word Host::condition(Instance& instance, std::size_t number, std::vector<Param> params) {
+word Host::condition(Instance& instance, std::size_t number, const std::vector<Param>& params) {
     const word handler = table_entry(0, number);
     params_.assign(params.begin(), params.end());
+    next_param_ = 0;
     return call_handler(handler, instance, {instance.address(), 0, 0});
 }
 
-word Host::action(Instance& instance, std::size_t number, std::vector<Param> params) {
+word Host::action(Instance& instance, std::size_t number, const std::vector<Param>& params) {
     const word handler = table_entry(1, number);
     params_.assign(params.begin(), params.end());
+    next_param_ = 0;
     return call_handler(handler, instance, {instance.address(), 0, 0});
 }
 
-word Host::expression(Instance& instance, std::size_t number, std::vector<Param> params, word param_word) {
+word Host::expression(Instance& instance, std::size_t number, const std::vector<Param>& params, word param_word) {
     const word handler = table_entry(2, number);
     params_.assign(params.begin(), params.end());
+    next_param_ = 0;
     return call_handler(handler, instance, {instance.address(), param_word});
 }
 
-word Host::event(Instance& instance, std::string_view display, std::vector<Param> params, word param_word) {
+word Host::event(Instance& instance, std::string_view display, const std::vector<Param>& params, word param_word) {
     for (const catalogue::Event& e : catalogue::kEvents) {
         if (e.display != display) {
             continue;
         }
         switch (e.kind) {
-            case catalogue::Kind::condition: return condition(instance, e.number, std::move(params));
-            case catalogue::Kind::action: return action(instance, e.number, std::move(params));
-            case catalogue::Kind::expression: return expression(instance, e.number, std::move(params), param_word);
+            case catalogue::Kind::condition: return condition(instance, e.number, params);
+            case catalogue::Kind::action: return action(instance, e.number, params);
+            case catalogue::Kind::expression: return expression(instance, e.number, params, param_word);
         }
     }
     throw std::invalid_argument("no event \"" + std::string(display) + "\"");

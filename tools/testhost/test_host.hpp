@@ -8,9 +8,10 @@
 // sides.
 #pragma once
 
+#include <algorithm>
+#include <array>
 #include <cstddef>
 #include <cstdint>
-#include <deque>
 #include <initializer_list>
 #include <memory>
 #include <optional>
@@ -130,7 +131,7 @@ private:
     bool owned_ = false;
     bool loader_owned_ = false;
     const Allocations* allocations_ = nullptr;
-    std::vector<Symbol> symbols_;  // linked in: the program's own table
+    std::vector<Symbol> symbols_;     // linked in: the program's own table
     std::shared_ptr<PeImage> image_;  // a DLL the test host mapped itself
 };
 
@@ -161,8 +162,19 @@ struct HostCall {
         open_file,
         close_file
     };
+    // At most three words, held in place: a call is recorded for every
+    // parameter, and recording must not allocate.
+    struct Args {
+        std::array<word, 3> words{};
+        std::size_t count = 0;
+        Args(std::initializer_list<word> list) : count(list.size()) {
+            std::copy(list.begin(), list.end(), words.begin());
+        }
+        std::size_t size() const { return count; }
+        word operator[](std::size_t i) const { return words[i]; }
+    };
     Routine routine;
-    std::vector<word> args;
+    Args args;
     word result = 0;  // what the host gave back
 };
 
@@ -245,12 +257,13 @@ public:
 
     // Handlers, by kind and number. The parameters are queued and handed out
     // by the host routines in order; every queued value must be consumed.
-    word condition(Instance& instance, std::size_t number, std::vector<Param> params = {});
-    word action(Instance& instance, std::size_t number, std::vector<Param> params = {});
-    word expression(Instance& instance, std::size_t number, std::vector<Param> params = {}, word param_word = 0);
+    word condition(Instance& instance, std::size_t number, const std::vector<Param>& params = {});
+    word action(Instance& instance, std::size_t number, const std::vector<Param>& params = {});
+    word expression(Instance& instance, std::size_t number, const std::vector<Param>& params = {}, word param_word = 0);
 
     // Handlers by display string ("Add Integer: %0", "IntegersSize(", ...).
-    word event(Instance& instance, std::string_view display, std::vector<Param> params = {}, word param_word = 0);
+    word event(Instance& instance, std::string_view display, const std::vector<Param>& params = {},
+               word param_word = 0);
 
     // Results.
     static std::string text_at(word result);
@@ -261,7 +274,7 @@ public:
     void clear_calls() { calls_.clear(); }
     std::size_t calls_to(HostCall::Routine routine) const;
     // Left from the last handler call; each handler call starts a new queue.
-    std::size_t unconsumed_params() const { return params_.size(); }
+    std::size_t unconsumed_params() const { return params_.size() - next_param_; }
     // Parameter requests the queue could not serve (they got 0).
     std::size_t missing_params() const { return missing_params_; }
 
@@ -291,12 +304,15 @@ private:
     std::vector<word> header_;    // HostRunHeader: a table of words
     std::vector<word> services_;  // HostServiceTable
     std::vector<std::unique_ptr<Instance>> instances_;
-    std::deque<Param> params_;
+    // The queue of one handler call; kept between calls so that a host
+    // driving millions of events allocates for none of them.
+    std::vector<Param> params_;
+    std::size_t next_param_ = 0;
     std::vector<HostCall> calls_;
     // Parameter strings: exact-size copies, freed when the handler returns,
     // so a library that keeps a pointer instead of a copy reads freed memory.
-    std::deque<std::unique_ptr<char[]>> held_strings_;
-    std::deque<std::unique_ptr<char[]>> result_buffers_;
+    std::vector<std::unique_ptr<char[]>> held_strings_;
+    std::vector<std::unique_ptr<char[]>> result_buffers_;
     std::vector<unsigned char> info_block_;
     word record_size_ = 0;
     bool no_buffer_ = false;
