@@ -500,10 +500,8 @@ const std::string& missing_path() {
 }
 
 void write_file(const std::string& bytes) {
-    static std::FILE* const file = std::fopen(file_path().c_str(), "wb");  // kept open: a load is frequent
-    if (file == nullptr || std::fseek(file, 0, SEEK_SET) != 0 ||
-        std::fwrite(bytes.data(), 1, bytes.size(), file) != bytes.size() || std::fflush(file) != 0 ||
-        ::ftruncate(::fileno(file), static_cast<off_t>(bytes.size())) != 0) {
+    std::FILE* file = std::fopen(file_path().c_str(), "wb");
+    if (file == nullptr || std::fwrite(bytes.data(), 1, bytes.size(), file) != bytes.size() || std::fclose(file) != 0) {
         std::fprintf(stderr, "fuzzer: cannot write %s\n", file_path().c_str());
         std::abort();
     }
@@ -1060,11 +1058,18 @@ private:
         const std::size_t made = draws::made();
         // Tree and index both: two outcomes can differ in the order of
         // additions alone, which leaves the same tree when the lines do not
-        // meet on their way down.
-        const std::string library = library_shape(s.host->root(kStrings), kStrings) + '|' + library_index(s);
+        // meet on their way down. The index is read once, when a tree matches.
+        std::optional<std::vector<std::string>> index;
         const auto matches = [&](const fuzzmodel::Instance& m, std::size_t used) {
-            return used == made && m.strings_size() == s.host->count(kStrings) &&
-                   model_shape(m.strings()) + '|' + model_index(m) == library;
+            if (used != made || m.strings_size() != s.host->count(kStrings) ||
+                !same_tree(s.host->root(kStrings), m.strings(),
+                           [](NodeView n, const std::string& v) { return n.string() == v; })) {
+                return false;
+            }
+            if (!index) {
+                index = library_index(s);
+            }
+            return *index == model_index(m);
         };
         if (matches(*s.model, full_draws)) {
             return full_draws;
@@ -1088,28 +1093,23 @@ private:
             std::to_string(made) + " times, holds " + std::to_string(s.host->count(kStrings)) + " strings)");
     }
 
-    // The string index read back through StringElementAt$, each entry with
-    // its length; the result flags are put back as they were.
-    std::string library_index(Subject& s) {
-        std::string out;
-        if (s.indexes[kStrings] == 0) {
-            return out;
-        }
+    // The string index read back through StringElementAt$; the result flags
+    // are put back as they were.
+    std::vector<std::string> library_index(Subject& s) {
+        std::vector<std::string> out;
         const std::uint16_t flags = s.host->result_flags();
-        for (std::int32_t p = 0; p < s.host->count(kStrings); ++p) {
-            const std::string v = Host::text_at(host_.expression(*s.host, 11, {Param::of(p)}, 0));
-            out += std::to_string(v.size()) + ':' + v;
+        for (std::int32_t p = 0; s.indexes[kStrings] != 0 && p < s.host->count(kStrings); ++p) {
+            out.push_back(Host::text_at(host_.expression(*s.host, 11, {Param::of(p)}, 0)));
         }
         s.host->set_result_flags(flags);
         host_.clear_calls();
         return out;
     }
 
-    static std::string model_index(const fuzzmodel::Instance& m) {
-        std::string out;
+    static std::vector<std::string> model_index(const fuzzmodel::Instance& m) {
+        std::vector<std::string> out;
         for (const int slot : m.strings().index) {
-            const std::string& v = m.strings().at(slot).value;
-            out += std::to_string(v.size()) + ':' + v;
+            out.push_back(m.strings().at(slot).value);
         }
         return out;
     }

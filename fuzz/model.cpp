@@ -356,13 +356,17 @@ void Instance::load(const std::optional<std::string>& file, std::int32_t balance
         }
         return;
     }
-    while (!lines.empty()) {
-        const std::size_t n = lines.size();
-        const int r = draws.next();
-        const std::size_t k = static_cast<std::size_t>(r & 0x7FFF) % n;
-        const std::string line = lines[k];
-        lines.erase(lines.begin() + static_cast<std::ptrdiff_t>(k));
-        add_line(line);
+    // The lines not yet added, in file order: a list whose gap closes. It
+    // holds line numbers, so that closing the gap moves no strings.
+    std::vector<std::size_t> left(lines.size());
+    for (std::size_t i = 0; i < left.size(); ++i) {
+        left[i] = i;
+    }
+    while (!left.empty()) {
+        const std::size_t k = static_cast<std::size_t>(draws.next() & 0x7FFF) % left.size();
+        const std::size_t line = left[k];
+        left.erase(left.begin() + static_cast<std::ptrdiff_t>(k));
+        add_line(lines[line]);
     }
 }
 
