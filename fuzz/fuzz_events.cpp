@@ -765,85 +765,44 @@ private:
         }
     }
 
-    // A tree as text, preorder with "-" for every empty link: equal texts
-    // mean equal trees. Floats show their bits, strings their length.
-    static std::string text_of(std::int32_t v) { return std::to_string(v); }
-    static std::string text_of(float v) { return hex32(std::bit_cast<std::uint32_t>(v)); }
-    static std::string text_of(const std::string& v) { return std::to_string(v.size()) + ':' + v; }
-
-    static std::string library_shape(word root, int collection) {
-        return sorvel::test::preorder(
-            NodeView{root}.address, word{0},
-            [](word n) {
-                return std::pair{NodeView{n}.left().address, NodeView{n}.right().address};
-            },
-            [collection](word n) {
-                const NodeView v{n};
-                return collection == kIntegers ? text_of(v.integer())
-                       : collection == kFloats ? text_of(v.floating())
-                                               : text_of(v.string());
-            });
-    }
-
-    template <class V>
-    static std::string model_shape(const fuzzmodel::Collection<V>& c) {
-        return sorvel::test::preorder(
-            c.root, fuzzmodel::kNone,
-            [&c](int n) {
-                return std::pair{c.at(n).left, c.at(n).right};
-            },
-            [&c](int n) { return text_of(c.at(n).value); });
-    }
-
-    static std::string model_shape(const fuzzmodel::Instance& m, int collection) {
-        return collection == kIntegers ? model_shape(m.integers())
-               : collection == kFloats ? model_shape(m.floats())
-                                       : model_shape(m.strings());
-    }
-
-    // Walks both trees side by side; only when they differ are they put
-    // into words, to show where.
+    // Walks both trees side by side. Gives the model's node at which they
+    // first differ (kNone: at a missing one), or nothing when they agree.
     template <class V, class Same>
-    static bool same_tree(word root, const fuzzmodel::Collection<V>& c, Same same) {
+    static std::optional<int> difference(word root, const fuzzmodel::Collection<V>& c, Same same) {
         std::vector<std::pair<word, int>> pending{{root, c.root}};
         while (!pending.empty()) {
             const auto [lib, mod] = pending.back();
             pending.pop_back();
-            if ((lib == 0) != (mod == fuzzmodel::kNone)) {
-                return false;
+            if ((lib == 0) != (mod == fuzzmodel::kNone) || (lib != 0 && !same(NodeView{lib}, c.at(mod).value))) {
+                return mod;
             }
             if (lib != 0) {
-                const NodeView n{lib};
-                if (!same(n, c.at(mod).value)) {
-                    return false;
-                }
-                pending.emplace_back(n.left().address, c.at(mod).left);
-                pending.emplace_back(n.right().address, c.at(mod).right);
+                pending.emplace_back(NodeView{lib}.left().address, c.at(mod).left);
+                pending.emplace_back(NodeView{lib}.right().address, c.at(mod).right);
             }
         }
-        return true;
+        return std::nullopt;
+    }
+
+    static std::optional<int> difference(word root, const fuzzmodel::Collection<std::string>& c) {
+        return difference(root, c, [](NodeView n, const std::string& v) { return n.string() == v; });
     }
 
     void compare_tree(Subject& s, int collection) {
         const fuzzmodel::Instance& m = *s.model;
         const word root = s.host->root(collection);
-        const bool same =
+        const std::optional<int> at =
             collection == kIntegers
-                ? same_tree(root, m.integers(), [](NodeView n, std::int32_t v) { return n.integer() == v; })
+                ? difference(root, m.integers(), [](NodeView n, std::int32_t v) { return n.integer() == v; })
             : collection == kFloats
-                ? same_tree(root, m.floats(),
-                            [](NodeView n, float v) {
-                                return std::bit_cast<std::uint32_t>(n.floating()) == std::bit_cast<std::uint32_t>(v);
-                            })
-                : same_tree(root, m.strings(), [](NodeView n, const std::string& v) { return n.string() == v; });
-        const std::string library = same ? std::string() : library_shape(root, collection);
-        const std::string model = same ? std::string() : model_shape(m, collection);
-        if (library != model) {
-            const std::size_t at = static_cast<std::size_t>(
-                std::mismatch(library.begin(), library.end(), model.begin(), model.end()).first - library.begin());
-            const std::size_t from = at > 40 ? at - 40 : 0;
-            mismatch("collection " + std::to_string(collection) + " trees differ from byte " + std::to_string(at) +
-                     ": library ..." + show(library.substr(from, 120)) + ", model ..." + show(model.substr(from, 120)));
+                ? difference(root, m.floats(),
+                             [](NodeView n, float v) {
+                                 return std::bit_cast<std::uint32_t>(n.floating()) == std::bit_cast<std::uint32_t>(v);
+                             })
+                : difference(root, m.strings());
+        if (at) {
+            mismatch("collection " + std::to_string(collection) + ": the trees differ at model node " +
+                     std::to_string(*at) + " (" + std::to_string(count_of(m, collection)) + " nodes)");
         }
     }
 
@@ -1066,8 +1025,7 @@ private:
         std::optional<std::vector<std::string>> index;
         const auto matches = [&](const fuzzmodel::Instance& m, std::size_t used) {
             if (used != made || m.strings_size() != s.host->count(kStrings) ||
-                !same_tree(s.host->root(kStrings), m.strings(),
-                           [](NodeView n, const std::string& v) { return n.string() == v; })) {
+                difference(s.host->root(kStrings), m.strings())) {
                 return false;
             }
             if (!index) {
