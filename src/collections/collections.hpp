@@ -10,6 +10,7 @@
 #include <optional>
 
 #include "collections/insertion_index.hpp"
+#include "collections/link_index.hpp"
 #include "collections/memory.hpp"
 #include "collections/tree.hpp"
 
@@ -23,9 +24,11 @@ template <class V>
 struct Collection {
     using Node = TreeNode<V>;
     using Index = InsertionIndex<Node>;
+    using Links = LinkIndex<Node>;
     Node*& root;
     std::int32_t& count;
-    Index* index;  // null when the collection keeps no index
+    Index* index;            // null when the collection keeps no index
+    Links* links = nullptr;  // null: plain descents whatever the depth
 };
 
 using IntegerCollection = Collection<std::int32_t>;
@@ -103,5 +106,12 @@ const TreeNode<V>* node_at(const Collection<V>& c, std::int32_t position) noexce
     }
     return c.index->at(static_cast<std::uint32_t>(position));
 }
+
+// Instance storage for the side structures of the three collections.
+struct LinkIndexes {
+    LinkIndex<IntegerNode> integers;
+    LinkIndex<FloatNode> floats;
+    LinkIndex<StringNode> strings;
+};
 
 }  // namespace sorvel
