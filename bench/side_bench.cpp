@@ -259,27 +259,29 @@ BENCHMARK(BM_Random)
     ->ArgsProduct({{1'000, 10'000, 100'000, 1'000'000}, {0, 1, 2}, {0, 1, 2}, {0, 1}})
     ->Unit(benchmark::kMicrosecond);
 
-// Positions after removing 100,000 random values of 1,000,000: walking
-// positions 0, 1, 2, ... (walk 1) or at random (walk 0), and IndexOf.
-Fields<std::int32_t>& gapped_index() {
-    static Fields<std::int32_t>* f = [] {
-        auto* fields = new Fields<std::int32_t>(true, true);
-        IntegerCollection c = fields->view();
+// Positions in 1,000,000 random values, after removing 100,000 of them at
+// random (gaps 1) or none (gaps 0): walking positions 0, 1, 2, ... (walk 1)
+// or at random (walk 0), and IndexOf.
+Fields<std::int32_t>& index_fixture(bool gaps) {
+    static Fields<std::int32_t>* made[2] = {};
+    Fields<std::int32_t>*& f = made[gaps ? 1 : 0];
+    if (f == nullptr) {
+        f = new Fields<std::int32_t>(true, true);
+        IntegerCollection c = f->view();
         std::vector<std::int32_t> values = random_ints(1'000'000);
         for (const std::int32_t v : values) {
             add(c, v);
         }
         std::shuffle(values.begin(), values.end(), std::mt19937(6));
-        for (std::size_t i = 0; i < 100'000; ++i) {
+        for (std::size_t i = 0; gaps && i < 100'000; ++i) {
             remove(c, values[i]);
         }
-        return fields;
-    }();
+    }
     return *f;
 }
 
 void BM_Index_ElementAt(benchmark::State& state) {
-    const IntegerCollection c = gapped_index().view();
+    const IntegerCollection c = index_fixture(state.range(1) != 0).view();
     std::mt19937 random(7);
     std::int32_t next = 0;
     for (auto _ : state) {
@@ -289,18 +291,23 @@ void BM_Index_ElementAt(benchmark::State& state) {
         next = next + 1 == c.count ? 0 : next + 1;
     }
 }
-BENCHMARK(BM_Index_ElementAt)->ArgName("walk")->Arg(1)->Arg(0);
+BENCHMARK(BM_Index_ElementAt)->ArgNames({"walk", "gaps"})->ArgsProduct({{1, 0}, {1, 0}});
 
+// IndexOf (contains 0) against Contains (contains 1) of the same values.
 void BM_Index_IndexOf(benchmark::State& state) {
-    const IntegerCollection c = gapped_index().view();
+    const IntegerCollection c = index_fixture(true).view();
     const std::vector<std::int32_t> values = random_ints(1'000'000);
     std::size_t next = 0;
     for (auto _ : state) {
-        benchmark::DoNotOptimize(position_of(c, values[next]));
+        if (state.range(0) != 0) {
+            benchmark::DoNotOptimize(contains(c, values[next]));
+        } else {
+            benchmark::DoNotOptimize(position_of(c, values[next]));
+        }
         next = (next + 7919) % values.size();
     }
 }
-BENCHMARK(BM_Index_IndexOf);
+BENCHMARK(BM_Index_IndexOf)->ArgName("contains")->Arg(0)->Arg(1);
 
 // Heap bytes per held integer, from the C library's statistics: random or
 // sorted (deep) input, index off or on, side storage present or not.

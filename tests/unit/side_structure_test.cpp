@@ -1,6 +1,7 @@
 // Deep trees with the side structure of links: the shapes, answers and
 // positions match a plain-descent view, also when memory runs out while the
-// structure is built or grows. Shallow and mixed cases are the fuzzer's.
+// structure is built or grows, and after the index packs its empty slots.
+// Shallow and mixed cases are the fuzzer's.
 #include <gtest/gtest.h>
 
 #include <random>
@@ -36,10 +37,6 @@ struct Twin {
     return ::testing::AssertionSuccess();
 }
 
-std::int32_t zigzag(std::int32_t i, std::int32_t n) {
-    return i % 2 == 0 ? i / 2 : n - i / 2;
-}
-
 struct Case {
     const char* name;
     std::int32_t n;
@@ -50,8 +47,7 @@ struct Case {
 const Case kCases[] = {
     {"sorted", 3000, [](std::int32_t i, std::int32_t) { return i; }, 0},
     {"reversed", 3000, [](std::int32_t i, std::int32_t n) { return n - i; }, 1},
-    {"zigzag", 3000, zigzag, 2},
-    {"random", 3000, [](std::int32_t i, std::int32_t) { return static_cast<std::int32_t>((i * 7919) % 3001); }, 0},
+    {"zigzag", 3000, [](std::int32_t i, std::int32_t n) { return i % 2 == 0 ? i / 2 : n - i / 2; }, 2},
 };
 
 TEST(SideStructure, DeepShapesMatchPlainDescents) {
