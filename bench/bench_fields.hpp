@@ -12,8 +12,10 @@ struct Fields {
     TreeNode<V>* root = nullptr;
     std::int32_t count = 0;
     InsertionIndex<TreeNode<V>>* index = nullptr;
+    LinkIndex<TreeNode<V>> links;
+    bool with_links = false;  // false: plain descents, as before the side structure
 
-    explicit Fields(bool with_index = false) {
+    explicit Fields(bool with_index = false, bool linked = false) : with_links(linked) {
         if (with_index) {
             index = create_index<TreeNode<V>>();
         }
@@ -25,7 +27,7 @@ struct Fields {
         clear(c);
         destroy_index(index);
     }
-    Collection<V> view() { return Collection<V>{root, count, index}; }
+    Collection<V> view() { return Collection<V>{root, count, index, with_links ? &links : nullptr}; }
 };
 
 }  // namespace sorvel::bench

@@ -7,18 +7,64 @@
 namespace sorvel {
 namespace {
 
+#ifndef SORVEL_DESCENT_BOUND
+#define SORVEL_DESCENT_BOUND 128
+#endif
+// Random trees of millions of values stay well below this depth; deeper
+// descents mean a degenerate shape worth a side structure.
+constexpr std::uint32_t kDescentBound = SORVEL_DESCENT_BOUND;
+
+// Where a key sits: the link pointing at its node, or the null link where it
+// would hang. With a side structure, also its entry and, for a node with a
+// left subtree, that subtree's largest node.
+template <class Node>
+struct Place {
+    Node** link;
+    std::uint32_t entry = LinkIndex<Node>::kNone;
+    Node* below = nullptr;
+};
+
+template <class V, class Key, class Order>
+Place<TreeNode<V>> locate(const Collection<V>& c, const Key& key, const Order& order) noexcept {
+    using Node = TreeNode<V>;
+    LinkIndex<Node>* links = c.links;
+    if (links != nullptr && links->built()) {
+        const auto f = links->find(key, order);
+        Node* below = f.below == links->kNone ? nullptr : *links->link(f.below);
+        if (f.match != links->kNone) {
+            return {links->link(f.match), f.match, below};
+        }
+        // A new leaf hangs from its predecessor's right link or, when that is
+        // taken, from its successor's left link.
+        if (below != nullptr && below->right == nullptr) {
+            return {&below->right};
+        }
+        return {f.above == links->kNone ? &c.root : &(*links->link(f.above))->left};
+    }
+    std::uint32_t depth = 0;
+    Node** link = TreeSteps<Node>::descend(c.root, key, order, depth);
+    if (depth > kDescentBound && links != nullptr && links->may_build(c.count)) {
+        links->build(c.root, c.count);
+        if (links->built()) {
+            return locate(c, key, order);
+        }
+    }
+    return {link};
+}
+
 template <class V, class Key, class Order>
 bool contains_key(const Collection<V>& c, const Key& key, const Order& order) noexcept {
-    return TreeSteps<TreeNode<V>>::find(c.root, key, order) != nullptr;
+    return *locate(c, key, order).link != nullptr;
 }
 
 // Leaf insertion. The node is made only once the value is known to be new
-// and the index has room, so a failure leaves everything as it was.
+// and the index has room, so a failure leaves everything as it was. The side
+// structure follows, or is dropped if it cannot grow.
 template <class V, class Key, class Order, class Make>
 bool add_key(Collection<V>& c, const Key& key, const Order& order, Make&& make) noexcept {
     using Node = TreeNode<V>;
-    Node** link = TreeSteps<Node>::leaf_link(c.root, key, order);
-    if (link == nullptr) {
+    Node** link = locate(c, key, order).link;
+    if (*link != nullptr) {
         return false;
     }
     if (c.index != nullptr && !c.index->reserve_one()) {
@@ -36,17 +82,37 @@ bool add_key(Collection<V>& c, const Key& key, const Order& order, Make&& make) 
         c.index->append(node);
     }
     ++c.count;
+    if (c.links != nullptr && c.links->built() && !c.links->insert(link, order)) {
+        c.links->give_up(c.count);
+    }
     return true;
 }
 
 template <class V, class Key, class Order>
 bool remove_key(Collection<V>& c, const Key& key, const Order& order) noexcept {
     using Node = TreeNode<V>;
-    Node** link = TreeSteps<Node>::link_to(c.root, key, order);
-    if (link == nullptr) {
+    const Place<Node> place = locate(c, key, order);
+    Node* removed = *place.link;
+    if (removed == nullptr) {
         return false;
     }
-    Node* removed = TreeSteps<Node>::detach(link);
+    Node* smaller = removed->left;
+    Node* larger = removed->right;
+    Node* below = place.below;
+    if (smaller != nullptr && larger != nullptr && below == nullptr) {
+        below = TreeSteps<Node>::largest(smaller);
+    }
+    TreeSteps<Node>::detach(place.link, below);
+    // Only the two children now hang from other links.
+    if (place.entry != LinkIndex<Node>::kNone) {
+        c.links->erase(place.entry, order);
+        if (smaller != nullptr) {
+            c.links->relink(c.links->find(smaller->value, order).match, place.link);
+        }
+        if (larger != nullptr) {
+            c.links->relink(c.links->find(larger->value, order).match, smaller != nullptr ? &below->right : place.link);
+        }
+    }
     if (c.index != nullptr) {
         c.index->erase(removed);
     }
@@ -64,6 +130,9 @@ void free_nodes(TreeNode<V>* root) noexcept {
 template <class V>
 void clear_collection(Collection<V>& c) noexcept {
     c.count = 0;
+    if (c.links != nullptr) {
+        c.links->drop();
+    }
     if (c.index != nullptr) {
         c.index->clear();
     }
@@ -77,7 +146,7 @@ std::int32_t position_of_key(const Collection<V>& c, const Key& key, const Order
     if (c.index == nullptr || c.index->empty()) {
         return -1;
     }
-    const TreeNode<V>* node = TreeSteps<TreeNode<V>>::find(c.root, key, order);
+    const TreeNode<V>* node = *locate(c, key, order).link;
     return node == nullptr ? -1 : c.index->position_of(node);
 }
 
@@ -132,27 +201,27 @@ int CompareStrings(const char* a, const char* b, bool case_sensitive) noexcept {
     }
 }
 
-bool contains(const IntegerCollection& c, std::int32_t value) noexcept {
+bool contains(IntegerCollection c, std::int32_t value) noexcept {
     return contains_key(c, value, IntegerOrder{});
 }
 
-bool contains(const FloatCollection& c, float value) noexcept {
+bool contains(FloatCollection c, float value) noexcept {
     return !std::isnan(value) && contains_key(c, value, FloatOrder{});
 }
 
-bool contains(const StringCollection& c, const char* value, bool case_sensitive) noexcept {
+bool contains(StringCollection c, const char* value, bool case_sensitive) noexcept {
     return value != nullptr && contains_key(c, value, StringOrder{case_sensitive});
 }
 
-bool add(IntegerCollection& c, std::int32_t value) noexcept {
+bool add(IntegerCollection c, std::int32_t value) noexcept {
     return add_key(c, value, IntegerOrder{}, [value] { return make_number_node(value); });
 }
 
-bool add(FloatCollection& c, float value) noexcept {
+bool add(FloatCollection c, float value) noexcept {
     return !std::isnan(value) && add_key(c, value, FloatOrder{}, [value] { return make_number_node(value); });
 }
 
-bool AddStringValue(StringCollection& c, const char* value, bool case_sensitive) noexcept {
+bool AddStringValue(StringCollection c, const char* value, bool case_sensitive) noexcept {
     if (value == nullptr) {
         return false;
     }
@@ -171,33 +240,47 @@ bool AddStringValue(StringCollection& c, const char* value, bool case_sensitive)
     });
 }
 
-bool remove(IntegerCollection& c, std::int32_t value) noexcept { return remove_key(c, value, IntegerOrder{}); }
+bool remove(IntegerCollection c, std::int32_t value) noexcept {
+    return remove_key(c, value, IntegerOrder{});
+}
 
-bool remove(FloatCollection& c, float value) noexcept {
+bool remove(FloatCollection c, float value) noexcept {
     return !std::isnan(value) && remove_key(c, value, FloatOrder{});
 }
 
-bool remove(StringCollection& c, const char* value, bool case_sensitive) noexcept {
+bool remove(StringCollection c, const char* value, bool case_sensitive) noexcept {
     return value != nullptr && remove_key(c, value, StringOrder{case_sensitive});
 }
 
-void clear(IntegerCollection& c) noexcept { clear_collection(c); }
-void clear(FloatCollection& c) noexcept { clear_collection(c); }
-void clear(StringCollection& c) noexcept { clear_collection(c); }
+void clear(IntegerCollection c) noexcept {
+    clear_collection(c);
+}
+void clear(FloatCollection c) noexcept {
+    clear_collection(c);
+}
+void clear(StringCollection c) noexcept {
+    clear_collection(c);
+}
 
-void free_tree(IntegerNode* root) noexcept { free_nodes(root); }
-void free_tree(FloatNode* root) noexcept { free_nodes(root); }
-void FreeStringTree(StringNode* root) noexcept { free_nodes(root); }
+void free_tree(IntegerNode* root) noexcept {
+    free_nodes(root);
+}
+void free_tree(FloatNode* root) noexcept {
+    free_nodes(root);
+}
+void FreeStringTree(StringNode* root) noexcept {
+    free_nodes(root);
+}
 
-std::int32_t position_of(const IntegerCollection& c, std::int32_t value) noexcept {
+std::int32_t position_of(IntegerCollection c, std::int32_t value) noexcept {
     return position_of_key(c, value, IntegerOrder{});
 }
 
-std::int32_t position_of(const FloatCollection& c, float value) noexcept {
+std::int32_t position_of(FloatCollection c, float value) noexcept {
     return std::isnan(value) ? -1 : position_of_key(c, value, FloatOrder{});
 }
 
-std::int32_t position_of(const StringCollection& c, const char* value, bool case_sensitive) noexcept {
+std::int32_t position_of(StringCollection c, const char* value, bool case_sensitive) noexcept {
     return value == nullptr ? -1 : position_of_key(c, value, StringOrder{case_sensitive});
 }
 

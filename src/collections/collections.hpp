@@ -10,6 +10,7 @@
 #include <optional>
 
 #include "collections/insertion_index.hpp"
+#include "collections/link_index.hpp"
 #include "collections/memory.hpp"
 #include "collections/tree.hpp"
 
@@ -23,9 +24,11 @@ template <class V>
 struct Collection {
     using Node = TreeNode<V>;
     using Index = InsertionIndex<Node>;
+    using Links = LinkIndex<Node>;
     Node*& root;
     std::int32_t& count;
-    Index* index;  // null when the collection keeps no index
+    Index* index;            // null when the collection keeps no index
+    Links* links = nullptr;  // null: plain descents whatever the depth
 };
 
 using IntegerCollection = Collection<std::int32_t>;
@@ -54,23 +57,23 @@ struct StringOrder {
 };
 
 // Conditions and actions.
-bool contains(const IntegerCollection& c, std::int32_t value) noexcept;
-bool contains(const FloatCollection& c, float value) noexcept;
-bool contains(const StringCollection& c, const char* value, bool case_sensitive) noexcept;
+bool contains(IntegerCollection c, std::int32_t value) noexcept;
+bool contains(FloatCollection c, float value) noexcept;
+bool contains(StringCollection c, const char* value, bool case_sensitive) noexcept;
 
 // Add gives true when the value was stored: false for a duplicate, a NaN, a
 // null string, or when memory ran out.
-bool add(IntegerCollection& c, std::int32_t value) noexcept;
-bool add(FloatCollection& c, float value) noexcept;
-bool AddStringValue(StringCollection& c, const char* value, bool case_sensitive) noexcept;
+bool add(IntegerCollection c, std::int32_t value) noexcept;
+bool add(FloatCollection c, float value) noexcept;
+bool AddStringValue(StringCollection c, const char* value, bool case_sensitive) noexcept;
 
-bool remove(IntegerCollection& c, std::int32_t value) noexcept;
-bool remove(FloatCollection& c, float value) noexcept;
-bool remove(StringCollection& c, const char* value, bool case_sensitive) noexcept;
+bool remove(IntegerCollection c, std::int32_t value) noexcept;
+bool remove(FloatCollection c, float value) noexcept;
+bool remove(StringCollection c, const char* value, bool case_sensitive) noexcept;
 
-void clear(IntegerCollection& c) noexcept;
-void clear(FloatCollection& c) noexcept;
-void clear(StringCollection& c) noexcept;
+void clear(IntegerCollection c) noexcept;
+void clear(FloatCollection c) noexcept;
+void clear(StringCollection c) noexcept;
 
 void free_tree(IntegerNode* root) noexcept;
 void free_tree(FloatNode* root) noexcept;
@@ -92,16 +95,23 @@ void destroy_index(InsertionIndex<Node>* index) noexcept {
 }
 
 // Queries. Positions count successful Adds from 0, in insertion order.
-std::int32_t position_of(const IntegerCollection& c, std::int32_t value) noexcept;
-std::int32_t position_of(const FloatCollection& c, float value) noexcept;
-std::int32_t position_of(const StringCollection& c, const char* value, bool case_sensitive) noexcept;
+std::int32_t position_of(IntegerCollection c, std::int32_t value) noexcept;
+std::int32_t position_of(FloatCollection c, float value) noexcept;
+std::int32_t position_of(StringCollection c, const char* value, bool case_sensitive) noexcept;
 
 template <class V>
-const TreeNode<V>* node_at(const Collection<V>& c, std::int32_t position) noexcept {
+const TreeNode<V>* node_at(Collection<V> c, std::int32_t position) noexcept {
     if (c.index == nullptr || position < 0 || static_cast<std::uint32_t>(position) >= c.index->size()) {
         return nullptr;
     }
     return c.index->at(static_cast<std::uint32_t>(position));
 }
+
+// Instance storage for the side structures of the three collections.
+struct LinkIndexes {
+    LinkIndex<IntegerNode> integers;
+    LinkIndex<FloatNode> floats;
+    LinkIndex<StringNode> strings;
+};
 
 }  // namespace sorvel

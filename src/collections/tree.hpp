@@ -42,62 +42,42 @@ using TreeNode = detail::NodeFields<V>;
 // positive when the key is larger, negative when smaller, zero when equal.
 template <class Node>
 struct TreeSteps {
-    // Descent: the node holding a value equal to key, or null.
+    // Descent: the link that points at the node equal to key, or the null
+    // link where key would hang as a new leaf. `depth` counts the nodes passed.
     template <class Key, class Order>
-    static Node* find(Node* root, const Key& key, const Order& order) noexcept {
-        while (root != nullptr) {
-            const int c = order(key, root->value);
-            if (c == 0) {
-                return root;
-            }
-            root = c > 0 ? root->right : root->left;
-        }
-        return nullptr;
-    }
-
-    // The null link where key would be inserted as a leaf, or null when an
-    // equal value is already held.
-    template <class Key, class Order>
-    static Node** leaf_link(Node*& root, const Key& key, const Order& order) noexcept {
+    static Node** descend(Node*& root, const Key& key, const Order& order, std::uint32_t& depth) noexcept {
         Node** link = &root;
+        depth = 0;
         while (*link != nullptr) {
             const int c = order(key, (*link)->value);
             if (c == 0) {
-                return nullptr;
+                break;
             }
+            ++depth;
             link = c > 0 ? &(*link)->right : &(*link)->left;
         }
         return link;
     }
 
-    // The link that points at the node equal to key, or null.
-    template <class Key, class Order>
-    static Node** link_to(Node*& root, const Key& key, const Order& order) noexcept {
-        Node** link = &root;
-        while (*link != nullptr) {
-            const int c = order(key, (*link)->value);
-            if (c == 0) {
-                return link;
-            }
-            link = c > 0 ? &(*link)->right : &(*link)->left;
+    // The largest node of a subtree: the end of its right spine.
+    static Node* largest(Node* node) noexcept {
+        while (node->right != nullptr) {
+            node = node->right;
         }
-        return nullptr;
+        return node;
     }
 
     // Removal by re-insertion, detaching the node that *link points at.
     // Re-inserting the left subtree from the root ends at this same link, and
     // re-inserting the right subtree then runs down the left subtree's right
-    // spine, so both are hung there directly: same shape, no walk from the root.
-    static Node* detach(Node** link) noexcept {
+    // spine, so both are hung there directly: same shape, no walk from the
+    // root. `below` is the largest node of the left subtree when both exist.
+    static Node* detach(Node** link, Node* below) noexcept {
         Node* removed = *link;
         if (removed->left != nullptr) {
             *link = removed->left;
             if (removed->right != nullptr) {
-                Node* largest = removed->left;
-                while (largest->right != nullptr) {
-                    largest = largest->right;
-                }
-                largest->right = removed->right;
+                below->right = removed->right;
             }
         } else {
             *link = removed->right;

@@ -16,6 +16,17 @@ struct ParamReader {
     ParamRoutine current;
 };
 
+// The one block the library allocates per instance: the reader first, so that
+// the record's reader pointer also finds the side structures of the trees.
+struct InstanceBlock {
+    ParamReader reader;
+    LinkIndexes links;
+};
+
+inline LinkIndexes* links_of(const RunRecord* r) noexcept {
+    return r->reader == nullptr ? nullptr : &reinterpret_cast<InstanceBlock*>(r->reader)->links;
+}
+
 // Host types for expression parameters, and selectors for event parameters.
 inline constexpr word kTypeInteger = 0;
 inline constexpr word kTypeString = 1;
@@ -35,7 +46,9 @@ inline HostRoutine host_routine(const RunRecord* record, std::size_t word_number
 inline word event_param(RunRecord* record, word selector) noexcept {
     return host_routine(record, host_words::kReadEventParam)(reinterpret_cast<word>(record), selector, 0);
 }
-inline std::int32_t event_integer(RunRecord* record) noexcept { return low32(event_param(record, kSelectInteger)); }
+inline std::int32_t event_integer(RunRecord* record) noexcept {
+    return low32(event_param(record, kSelectInteger));
+}
 inline float event_float(RunRecord* record) noexcept {
     return std::bit_cast<float>(static_cast<std::uint32_t>(event_param(record, kSelectFloat)));
 }
@@ -62,9 +75,21 @@ word float_result(RunRecord* record, float value) noexcept;
 word string_result(RunRecord* record, const char* text) noexcept;
 
 // Views of an instance's collections.
-inline IntegerCollection integers(RunRecord* r) noexcept { return {r->integer_root, r->integer_count, r->integer_index}; }
-inline FloatCollection floats(RunRecord* r) noexcept { return {r->float_root, r->float_count, r->float_index}; }
-inline StringCollection strings(RunRecord* r) noexcept { return {r->string_root, r->string_count, r->string_index}; }
-inline bool case_sensitive(const RunRecord* r) noexcept { return r->case_sensitive == 1; }
+// An instance without its block gets plain descents.
+inline IntegerCollection integers(RunRecord* r) noexcept {
+    LinkIndexes* l = links_of(r);
+    return {r->integer_root, r->integer_count, r->integer_index, l == nullptr ? nullptr : &l->integers};
+}
+inline FloatCollection floats(RunRecord* r) noexcept {
+    LinkIndexes* l = links_of(r);
+    return {r->float_root, r->float_count, r->float_index, l == nullptr ? nullptr : &l->floats};
+}
+inline StringCollection strings(RunRecord* r) noexcept {
+    LinkIndexes* l = links_of(r);
+    return {r->string_root, r->string_count, r->string_index, l == nullptr ? nullptr : &l->strings};
+}
+inline bool case_sensitive(const RunRecord* r) noexcept {
+    return r->case_sensitive == 1;
+}
 
 }  // namespace sorvel

@@ -46,7 +46,9 @@ SORVEL_EXPORT word SORVEL_CALL GetRunObjectInfos(word, word block_word) {
     return 1;
 }
 
-SORVEL_EXPORT word SORVEL_CALL GetRunObjectDataSize(word, word) { return sizeof(sorvel::RunRecord); }
+SORVEL_EXPORT word SORVEL_CALL GetRunObjectDataSize(word, word) {
+    return sizeof(sorvel::RunRecord);
+}
 
 SORVEL_EXPORT word SORVEL_CALL CreateRunObject(word record_word, word edit_word, word creation_word) {
     using namespace sorvel;
@@ -56,8 +58,8 @@ SORVEL_EXPORT word SORVEL_CALL CreateRunObject(word record_word, word edit_word,
     if (r == nullptr) {
         return 0;
     }
-    void* block = memory::allocate(sizeof(ParamReader));
-    r->reader = block == nullptr ? nullptr : new (block) ParamReader{r, read_first_param};
+    void* block = memory::allocate(sizeof(InstanceBlock));
+    r->reader = block == nullptr ? nullptr : &(new (block) InstanceBlock{{r, read_first_param}, {}})->reader;
     if (creation != nullptr) {
         r->creation_word_a = creation->word_at_8;
         r->creation_word_b = creation->word_at_12;
@@ -96,7 +98,11 @@ SORVEL_EXPORT word SORVEL_CALL DestroyRunObject(word record_word, word) {
     free_tree(r->integer_root);
     free_tree(r->float_root);
     FreeStringTree(r->string_root);
-    memory::release(r->reader);
+    if (r->reader != nullptr) {
+        InstanceBlock* block = reinterpret_cast<InstanceBlock*>(r->reader);
+        block->~InstanceBlock();
+        memory::release(block);
+    }
     // Nothing dangles: a second destroy frees nothing twice.
     r->integer_index = nullptr;
     r->float_index = nullptr;
@@ -108,10 +114,14 @@ SORVEL_EXPORT word SORVEL_CALL DestroyRunObject(word record_word, word) {
     return 0;
 }
 
-SORVEL_EXPORT word SORVEL_CALL HandleRunObject(word) { return 2; }
+SORVEL_EXPORT word SORVEL_CALL HandleRunObject(word) {
+    return 2;
+}
 
 // Stubs: each reads none of its arguments. Those whose answer the host leaves
 // undefined give 0.
 #define SORVEL_STUB(name, ordinal, params, result) \
-    SORVEL_EXPORT word SORVEL_CALL name params { return result; }
+    SORVEL_EXPORT word SORVEL_CALL name params {   \
+        return result;                             \
+    }
 SORVEL_STUB_LIST(SORVEL_STUB)

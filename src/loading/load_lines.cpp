@@ -188,7 +188,7 @@ void load_in_balanced_order(StringCollection& strings, bool case_sensitive, char
 
 }  // namespace
 
-void load_lines(StringCollection& strings, bool case_sensitive, char* data, std::size_t length, bool balanced,
+void load_lines(StringCollection strings, bool case_sensitive, char* data, std::size_t length, bool balanced,
                 DrawSource draw) noexcept {
     if (data == nullptr) {
         return;

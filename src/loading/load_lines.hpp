@@ -14,7 +14,7 @@ namespace sorvel {
 // lines are terminated in place, so no line is copied before it is stored.
 // Balanced order draws once per line, duplicates included; it adds nothing
 // and draws nothing when its bookkeeping cannot be allocated.
-void load_lines(StringCollection& strings, bool case_sensitive, char* data, std::size_t length, bool balanced,
+void load_lines(StringCollection strings, bool case_sensitive, char* data, std::size_t length, bool balanced,
                 DrawSource draw) noexcept;
 
 }  // namespace sorvel
