@@ -42,6 +42,11 @@ inline HostRoutine host_routine(const RunRecord* record, std::size_t word_number
     return reinterpret_cast<HostRoutine>(record->host_header[word_number]);
 }
 
+// An entry of the host's service table, which the header points at.
+inline word host_service(const RunRecord* record, std::size_t entry) noexcept {
+    return reinterpret_cast<const word*>(record->host_header[host_words::kServiceTable])[entry];
+}
+
 // Condition and action parameters, in declaration order.
 inline word event_param(RunRecord* record, word selector) noexcept {
     return host_routine(record, host_words::kReadEventParam)(reinterpret_cast<word>(record), selector, 0);

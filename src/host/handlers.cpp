@@ -1,5 +1,6 @@
 // Handlers: fetch the parameters, call the collections, hand back the result.
-// They have C names so that they can be found in the built library.
+// They have C names, which the catalogue lists, so that each can be found in
+// the built library.
 #include "host/handlers.hpp"
 
 #include "collections/random_path.hpp"
@@ -7,42 +8,42 @@
 #include "host/file_read.hpp"
 #include "loading/load_lines.hpp"
 
-using sorvel::RunRecord;
-using sorvel::word;
-
+namespace sorvel {
 namespace {
 
 template <class V>
-auto random_pick(sorvel::TreeNode<V>* root) noexcept {
-    return sorvel::random_path_pick(static_cast<const sorvel::TreeNode<V>*>(root), sorvel::runtime_draws());
+const TreeNode<V>* random_pick(Collection<V> c) noexcept {
+    return random_path_pick(static_cast<const TreeNode<V>*>(c.root), runtime_draws());
+}
+
+template <class V>
+V value_or_zero(const TreeNode<V>* node) noexcept {
+    return node == nullptr ? V{} : node->value;
+}
+
+const char* text_or_empty(const StringNode* node) noexcept {
+    return node == nullptr ? "" : node->value;
 }
 
 void load_from_file(RunRecord* r, const char* name, std::int32_t balance) noexcept {
-    using namespace sorvel;
     if (name == nullptr) {
         return;
     }
-    const auto* services = reinterpret_cast<const word*>(r->host_header[host_words::kServiceTable]);
-    const auto open = reinterpret_cast<HostRoutine>(services[host_words::kOpenFile]);
-    const auto close = reinterpret_cast<HostCloseRoutine>(services[host_words::kCloseFile]);
     std::uint32_t size = 0;
+    const auto open = reinterpret_cast<HostRoutine>(host_service(r, host_words::kOpenFile));
     const word handle = open(reinterpret_cast<word>(name), reinterpret_cast<word>(&size), 0);
     if (handle == -1) {
         return;
     }
     // One spare byte lets the last line be terminated in place.
     // Only a 32-bit size_t can lack room for it.
-    char* buffer = nullptr;
     const std::size_t bytes = size;
-    if (bytes != SIZE_MAX) {
-        buffer = static_cast<char*>(memory::allocate(bytes + 1));
-    }
+    char* buffer = bytes == SIZE_MAX ? nullptr : static_cast<char*>(memory::allocate(bytes + 1));
     if (buffer != nullptr) {
         const std::uint32_t read = read_once(handle, buffer, size);
-        StringCollection view = strings(r);
-        load_lines(view, case_sensitive(r), buffer, read < size ? read : size, balance != 0, runtime_draws());
+        load_lines(strings(r), case_sensitive(r), buffer, read < size ? read : size, balance != 0, runtime_draws());
     }
-    close(handle);
+    reinterpret_cast<HostCloseRoutine>(host_service(r, host_words::kCloseFile))(handle);
     memory::release(buffer);
 }
 
@@ -50,176 +51,139 @@ void load_from_file(RunRecord* r, const char* name, std::int32_t balance) noexce
 
 extern "C" {
 
+// Conditions and actions: each reads its parameters first.
 word SORVEL_CALL sorvel_contains_integer(RunRecord* r, word, word) {
-    const std::int32_t value = sorvel::event_integer(r);
-    return sorvel::contains(sorvel::integers(r), value) ? 1 : 0;
+    return contains(integers(r), event_integer(r));
 }
-
 word SORVEL_CALL sorvel_contains_float(RunRecord* r, word, word) {
-    const float value = sorvel::event_float(r);
-    return sorvel::contains(sorvel::floats(r), value) ? 1 : 0;
+    return contains(floats(r), event_float(r));
 }
-
 word SORVEL_CALL sorvel_contains_string(RunRecord* r, word, word) {
-    const char* value = sorvel::event_string(r);
-    return sorvel::contains(sorvel::strings(r), value, sorvel::case_sensitive(r)) ? 1 : 0;
+    return contains(strings(r), event_string(r), case_sensitive(r));
 }
 
 word SORVEL_CALL sorvel_add_integer(RunRecord* r, word, word) {
-    const std::int32_t value = sorvel::event_integer(r);
-    sorvel::IntegerCollection view = sorvel::integers(r);
-    sorvel::add(view, value);
+    add(integers(r), event_integer(r));
     return 0;
 }
-
 word SORVEL_CALL sorvel_remove_integer(RunRecord* r, word, word) {
-    const std::int32_t value = sorvel::event_integer(r);
-    sorvel::IntegerCollection view = sorvel::integers(r);
-    sorvel::remove(view, value);
+    remove(integers(r), event_integer(r));
     return 0;
 }
-
 word SORVEL_CALL sorvel_clear_integers(RunRecord* r, word, word) {
-    sorvel::IntegerCollection view = sorvel::integers(r);
-    sorvel::clear(view);
+    clear(integers(r));
     return 0;
 }
-
 word SORVEL_CALL sorvel_add_float(RunRecord* r, word, word) {
-    const float value = sorvel::event_float(r);
-    sorvel::FloatCollection view = sorvel::floats(r);
-    sorvel::add(view, value);
+    add(floats(r), event_float(r));
     return 0;
 }
-
 word SORVEL_CALL sorvel_remove_float(RunRecord* r, word, word) {
-    const float value = sorvel::event_float(r);
-    sorvel::FloatCollection view = sorvel::floats(r);
-    sorvel::remove(view, value);
+    remove(floats(r), event_float(r));
     return 0;
 }
-
 word SORVEL_CALL sorvel_clear_floats(RunRecord* r, word, word) {
-    sorvel::FloatCollection view = sorvel::floats(r);
-    sorvel::clear(view);
+    clear(floats(r));
     return 0;
 }
-
 word SORVEL_CALL sorvel_add_string(RunRecord* r, word, word) {
-    const char* value = sorvel::event_string(r);
-    sorvel::StringCollection view = sorvel::strings(r);
-    sorvel::AddStringValue(view, value, sorvel::case_sensitive(r));
+    AddStringValue(strings(r), event_string(r), case_sensitive(r));
     return 0;
 }
-
 word SORVEL_CALL sorvel_remove_string(RunRecord* r, word, word) {
-    const char* value = sorvel::event_string(r);
-    sorvel::StringCollection view = sorvel::strings(r);
-    sorvel::remove(view, value, sorvel::case_sensitive(r));
+    remove(strings(r), event_string(r), case_sensitive(r));
     return 0;
 }
-
 word SORVEL_CALL sorvel_clear_strings(RunRecord* r, word, word) {
-    sorvel::StringCollection view = sorvel::strings(r);
-    sorvel::clear(view);
+    clear(strings(r));
     return 0;
 }
-
 word SORVEL_CALL sorvel_load_from_file(RunRecord* r, word, word) {
-    const char* name = sorvel::event_string(r);
-    const std::int32_t balance = sorvel::event_integer(r);
-    load_from_file(r, name, balance);
+    const char* name = event_string(r);  // the name before the flag
+    load_from_file(r, name, event_integer(r));
     return 0;
 }
 
+// Expressions: each resets the reader, then fetches its parameter.
 word SORVEL_CALL sorvel_integers_size(RunRecord* r, word) {
-    sorvel::reset_reader(r);
+    reset_reader(r);
     return r->integer_count;
 }
-
 word SORVEL_CALL sorvel_integers_random_element(RunRecord* r, word) {
-    sorvel::reset_reader(r);
-    const sorvel::IntegerNode* node = random_pick(r->integer_root);
-    return node == nullptr ? 0 : node->value;
+    reset_reader(r);
+    return value_or_zero(random_pick(integers(r)));
 }
-
 word SORVEL_CALL sorvel_floats_size(RunRecord* r, word) {
-    sorvel::reset_reader(r);
+    reset_reader(r);
     return r->float_count;
 }
-
 word SORVEL_CALL sorvel_floats_random_element(RunRecord* r, word) {
-    sorvel::reset_reader(r);
-    const sorvel::FloatNode* node = random_pick(r->float_root);
-    return sorvel::float_result(r, node == nullptr ? 0.0F : node->value);
+    reset_reader(r);
+    return float_result(r, value_or_zero(random_pick(floats(r))));
 }
-
 word SORVEL_CALL sorvel_strings_size(RunRecord* r, word) {
-    sorvel::reset_reader(r);
+    reset_reader(r);
     return r->string_count;
 }
-
 word SORVEL_CALL sorvel_strings_random_element(RunRecord* r, word) {
-    sorvel::reset_reader(r);
-    const sorvel::StringNode* node = random_pick(r->string_root);
-    return sorvel::string_result(r, node == nullptr ? "" : node->value);
+    reset_reader(r);
+    return string_result(r, text_or_empty(random_pick(strings(r))));
 }
-
-word SORVEL_CALL sorvel_index_of_integer(RunRecord* r, word param) {
-    sorvel::reset_reader(r);
-    const std::int32_t value = sorvel::expr_integer(r, param);
-    return sorvel::position_of(sorvel::integers(r), value);
+word SORVEL_CALL sorvel_index_of_integer(RunRecord* r, word p) {
+    reset_reader(r);
+    return position_of(integers(r), expr_integer(r, p));
 }
-
-word SORVEL_CALL sorvel_integer_at(RunRecord* r, word param) {
-    sorvel::reset_reader(r);
-    const std::int32_t position = sorvel::expr_integer(r, param);
-    const sorvel::IntegerNode* node = sorvel::node_at(sorvel::integers(r), position);
-    return node == nullptr ? 0 : node->value;
+word SORVEL_CALL sorvel_integer_at(RunRecord* r, word p) {
+    reset_reader(r);
+    return value_or_zero(node_at(integers(r), expr_integer(r, p)));
 }
-
-word SORVEL_CALL sorvel_index_of_float(RunRecord* r, word param) {
-    sorvel::reset_reader(r);
-    const float value = sorvel::expr_float(r, param);
-    return sorvel::position_of(sorvel::floats(r), value);
+word SORVEL_CALL sorvel_index_of_float(RunRecord* r, word p) {
+    reset_reader(r);
+    return position_of(floats(r), expr_float(r, p));
 }
-
-word SORVEL_CALL sorvel_float_at(RunRecord* r, word param) {
-    sorvel::reset_reader(r);
-    const std::int32_t position = sorvel::expr_integer(r, param);
-    const sorvel::FloatNode* node = sorvel::node_at(sorvel::floats(r), position);
-    return sorvel::float_result(r, node == nullptr ? 0.0F : node->value);
+word SORVEL_CALL sorvel_float_at(RunRecord* r, word p) {
+    reset_reader(r);
+    return float_result(r, value_or_zero(node_at(floats(r), expr_integer(r, p))));
 }
-
-word SORVEL_CALL sorvel_index_of_string(RunRecord* r, word param) {
-    sorvel::reset_reader(r);
-    const char* value = sorvel::expr_string(r, param);
-    return sorvel::position_of(sorvel::strings(r), value, sorvel::case_sensitive(r));
+word SORVEL_CALL sorvel_index_of_string(RunRecord* r, word p) {
+    reset_reader(r);
+    return position_of(strings(r), expr_string(r, p), case_sensitive(r));
 }
-
-word SORVEL_CALL sorvel_string_at(RunRecord* r, word param) {
-    sorvel::reset_reader(r);
-    const std::int32_t position = sorvel::expr_integer(r, param);
-    const sorvel::StringNode* node = sorvel::node_at(sorvel::strings(r), position);
-    return sorvel::string_result(r, node == nullptr ? "" : node->value);
+word SORVEL_CALL sorvel_string_at(RunRecord* r, word p) {
+    reset_reader(r);
+    return string_result(r, text_or_empty(node_at(strings(r), expr_integer(r, p))));
 }
 
 }  // extern "C"
 
-namespace sorvel {
-
+// In the catalogue's order, which names each entry's handler.
 const ConditionHandler kConditionTable[] = {sorvel_contains_integer, sorvel_contains_float, sorvel_contains_string,
                                             nullptr};
 
-const ActionHandler kActionTable[] = {
-    sorvel_add_integer, sorvel_remove_integer, sorvel_clear_integers, sorvel_add_float,  sorvel_remove_float,
-    sorvel_clear_floats, sorvel_add_string,    sorvel_remove_string,  sorvel_clear_strings, sorvel_load_from_file,
-    nullptr};
+const ActionHandler kActionTable[] = {sorvel_add_integer,
+                                      sorvel_remove_integer,
+                                      sorvel_clear_integers,
+                                      sorvel_add_float,
+                                      sorvel_remove_float,
+                                      sorvel_clear_floats,
+                                      sorvel_add_string,
+                                      sorvel_remove_string,
+                                      sorvel_clear_strings,
+                                      sorvel_load_from_file,
+                                      nullptr};
 
-const ExpressionHandler kExpressionTable[] = {
-    sorvel_integers_size,    sorvel_integers_random_element, sorvel_floats_size, sorvel_floats_random_element,
-    sorvel_strings_size,     sorvel_strings_random_element,  sorvel_index_of_integer, sorvel_integer_at,
-    sorvel_index_of_float,   sorvel_float_at,                sorvel_index_of_string,  sorvel_string_at,
-    nullptr};
+const ExpressionHandler kExpressionTable[] = {sorvel_integers_size,
+                                              sorvel_integers_random_element,
+                                              sorvel_floats_size,
+                                              sorvel_floats_random_element,
+                                              sorvel_strings_size,
+                                              sorvel_strings_random_element,
+                                              sorvel_index_of_integer,
+                                              sorvel_integer_at,
+                                              sorvel_index_of_float,
+                                              sorvel_float_at,
+                                              sorvel_index_of_string,
+                                              sorvel_string_at,
+                                              nullptr};
 
 }  // namespace sorvel

@@ -2,6 +2,8 @@
 // read with objdump, never run:
 //  - the export table holds exactly the host's names and ordinals, undecorated,
 //    each at its stdcall function;
+//  - the three handler tables hold the handlers the catalogue names, in its
+//    order, then a null;
 //  - every export, DllMain and every handler removes its own arguments: each
 //    of its returns is `ret 4*n`, following tail jumps;
 //  - it imports only from Windows system DLLs, so it loads on a bare system.
@@ -21,40 +23,11 @@
 #include <vector>
 
 #include "exports_table.hpp"
+#include "host/catalogue.hpp"
 
 namespace {
 
 std::string g_dll;
-
-// The handlers the tables hand out, by their symbols in the DLL: conditions
-// and actions take three words, expressions two.
-const std::vector<std::pair<const char*, int>> kHandlers = {
-    {"sorvel_contains_integer", 3},
-    {"sorvel_contains_float", 3},
-    {"sorvel_contains_string", 3},
-    {"sorvel_add_integer", 3},
-    {"sorvel_remove_integer", 3},
-    {"sorvel_clear_integers", 3},
-    {"sorvel_add_float", 3},
-    {"sorvel_remove_float", 3},
-    {"sorvel_clear_floats", 3},
-    {"sorvel_add_string", 3},
-    {"sorvel_remove_string", 3},
-    {"sorvel_clear_strings", 3},
-    {"sorvel_load_from_file", 3},
-    {"sorvel_integers_size", 2},
-    {"sorvel_integers_random_element", 2},
-    {"sorvel_floats_size", 2},
-    {"sorvel_floats_random_element", 2},
-    {"sorvel_strings_size", 2},
-    {"sorvel_strings_random_element", 2},
-    {"sorvel_index_of_integer", 2},
-    {"sorvel_integer_at", 2},
-    {"sorvel_index_of_float", 2},
-    {"sorvel_float_at", 2},
-    {"sorvel_index_of_string", 2},
-    {"sorvel_string_at", 2},
-};
 
 std::string decorated(const std::string& name, int args) {
     return "_" + name + "@" + std::to_string(4 * args);
@@ -186,13 +159,59 @@ void expect_callee_cleanup(const std::map<std::string, Function>& functions, con
     }
 }
 
+// A word of the image at an address, read from -s; a symbol's address from -t
+// and the sections' addresses from -h.
+struct Image {
+    std::map<unsigned long, unsigned char> bytes;
+    std::map<std::string, unsigned long> symbols;
+    unsigned long word_at(unsigned long address) const {
+        unsigned long w = 0;
+        for (unsigned long i = 4; i-- > 0;) {
+            const auto b = bytes.find(address + i);
+            w = w << 8U | (b == bytes.end() ? 0U : b->second);
+        }
+        return w;
+    }
+};
+
+Image parse_image(const std::string& sections, const std::string& symbols, const std::string& contents) {
+    static const std::regex section(R"(^\s+(\d+) \S+\s+[0-9a-f]+\s+([0-9a-f]+))"),
+        symbol(R"(\(sec\s+(\d+)\).*0x([0-9a-f]+) (\S+)$)"), line(R"(^ ([0-9a-f]+) ((?:[0-9a-f]+ ?){1,4}))");
+    Image image;
+    std::map<int, unsigned long> vma;
+    std::smatch m;
+    std::istringstream in(sections + symbols + contents);
+    for (std::string text; std::getline(in, text);) {
+        if (std::regex_search(text, m, section)) {
+            vma[std::stoi(m[1]) + 1] = std::stoul(m[2], nullptr, 16);
+        } else if (std::regex_search(text, m, symbol)) {
+            image.symbols[m[3]] = vma[std::stoi(m[1])] + std::stoul(m[2], nullptr, 16);
+        } else if (std::regex_search(text, m, line)) {
+            unsigned long at = std::stoul(m[1], nullptr, 16);
+            std::string hex = m[2];
+            hex.erase(std::remove(hex.begin(), hex.end(), ' '), hex.end());
+            for (std::size_t i = 0; i + 1 < hex.size(); i += 2) {
+                image.bytes[at++] = static_cast<unsigned char>(std::stoul(hex.substr(i, 2), nullptr, 16));
+            }
+        }
+    }
+    return image;
+}
+
+// Conditions and actions take three words, expressions two.
+int handler_args(const sorvel::catalogue::Event& e) {
+    return e.kind == sorvel::catalogue::Kind::expression ? 2 : 3;
+}
+
 class ProductDll : public ::testing::Test {
 protected:
     static void SetUpTestSuite() {
         headers_ = new Headers(parse_headers(objdump("-p")));
         functions_ = new std::map<std::string, Function>(parse_disassembly(objdump("-d")));
+        image_ = new Image(parse_image(objdump("-h"), objdump("-t"), objdump("-s")));
     }
     static inline Headers* headers_ = nullptr;
+    static inline Image* image_ = nullptr;
     static inline std::map<std::string, Function>* functions_ = nullptr;
 };
 
@@ -223,10 +242,34 @@ TEST_F(ProductDll, ExportsAndHandlersRemoveTheirArguments) {
     for (const sorvel::test::ExportEntry& e : sorvel::test::kExports) {
         callees.emplace_back(e.name, e.args);
     }
-    callees.insert(callees.end(), kHandlers.begin(), kHandlers.end());
+    for (const sorvel::catalogue::Event& e : sorvel::catalogue::kEvents) {
+        callees.emplace_back(e.handler, handler_args(e));
+    }
     for (const auto& [name, args] : callees) {
         std::set<std::string> seen;
         expect_callee_cleanup(*functions_, decorated(name, args), args, seen);
+    }
+}
+
+TEST_F(ProductDll, HandlerTablesHoldTheCataloguesHandlersInItsOrder) {
+    std::map<unsigned long, std::string> named;
+    for (const auto& [name, function] : *functions_) {
+        named[function.address] = name;
+    }
+    const std::pair<sorvel::catalogue::Kind, const char*> tables[] = {
+        {sorvel::catalogue::Kind::condition, "__ZN6sorvel15kConditionTableE"},
+        {sorvel::catalogue::Kind::action, "__ZN6sorvel12kActionTableE"},
+        {sorvel::catalogue::Kind::expression, "__ZN6sorvel16kExpressionTableE"}};
+    for (const auto& [kind, symbol] : tables) {
+        ASSERT_EQ(image_->symbols.count(symbol), 1U) << "no table " << symbol;
+        unsigned long at = image_->symbols[symbol];
+        for (const sorvel::catalogue::Event& e : sorvel::catalogue::kEvents) {
+            if (e.kind == kind) {
+                EXPECT_EQ(named[image_->word_at(at)], decorated(std::string(e.handler), handler_args(e))) << e.display;
+                at += 4;
+            }
+        }
+        EXPECT_EQ(image_->word_at(at), 0UL) << symbol << " ends with a null";
     }
 }
 
