@@ -6,7 +6,9 @@
 //    order, then a null;
 //  - every export, DllMain and every handler removes its own arguments: each
 //    of its returns is `ret 4*n`, following tail jumps;
-//  - it imports only from Windows system DLLs, so it loads on a bare system.
+//  - it imports only from Windows system DLLs, so it loads on a bare system;
+//  - its version resource names the product and the project version, and no
+//    company or copyright.
 // Usage: sorvel_dll_check [gtest flags] PATH/TO/sorvel.dll
 // The objdump program can be chosen with SORVEL_OBJDUMP.
 #include <gtest/gtest.h>
@@ -283,6 +285,50 @@ TEST_F(ProductDll, ImportsOnlySystemLibraries) {
     // Files are read with ReadFile, and draws come from the C runtime's rand that the host shares.
     EXPECT_EQ(headers_->imports["kernel32.dll"].count("ReadFile"), 1U);
     EXPECT_EQ(headers_->imports["msvcrt.dll"].count("rand"), 1U);
+}
+
+// The .rsrc section's bytes, from objdump's hex dump: an address, then up to
+// four groups of eight hex digits, then the same bytes as text.
+std::string resource_bytes() {
+    std::istringstream dump(objdump("-s -j .rsrc"));
+    std::string bytes;
+    for (std::string line; std::getline(dump, line);) {
+        static const std::regex row(R"(^ [0-9a-f]+ ((?:[0-9a-f]{2,8} ?){1,4}) )");
+        std::smatch m;
+        std::string hex = std::regex_search(line, m, row) ? m[1].str() : "";
+        std::erase(hex, ' ');
+        for (std::size_t i = 0; i + 1 < hex.size(); i += 2) {
+            bytes += static_cast<char>(std::stoi(hex.substr(i, 2), nullptr, 16));
+        }
+    }
+    return bytes;
+}
+
+// The value that follows a key of the version resource. Keys and values are
+// UTF-16, so the text kept is every low byte whose high byte is zero; the
+// padding between a key and its value reads as further NULs.
+std::string version_value(const std::string& narrow, const std::string& key) {
+    std::size_t at = narrow.find(key + '\0');
+    if (at == std::string::npos) {
+        return "";
+    }
+    at = narrow.find_first_not_of('\0', at + key.size());
+    return at == std::string::npos ? "" : narrow.substr(at, narrow.find('\0', at) - at);
+}
+
+TEST(ProductVersion, ResourceNamesTheProductAndVersionOnly) {
+    const std::string bytes = resource_bytes();
+    std::string narrow;
+    for (std::size_t i = 0; i + 1 < bytes.size(); i += 2) {
+        narrow += bytes[i + 1] == '\0' ? bytes[i] : '?';
+    }
+    ASSERT_NE(narrow.find("VS_VERSION_INFO"), std::string::npos) << "no version resource";
+    EXPECT_EQ(version_value(narrow, "ProductName"), "Sorvel");
+    EXPECT_EQ(version_value(narrow, "ProductVersion"), SORVEL_VERSION);
+    EXPECT_EQ(version_value(narrow, "FileVersion"), SORVEL_VERSION);
+    EXPECT_EQ(version_value(narrow, "OriginalFilename"), "sorvel.dll");
+    EXPECT_EQ(narrow.find("CompanyName"), std::string::npos);
+    EXPECT_EQ(narrow.find("LegalCopyright"), std::string::npos);
 }
 
 }  // namespace

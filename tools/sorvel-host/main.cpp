@@ -36,6 +36,7 @@ const char kUsage[] =
     "  --seed N                seed the C runtime's generator before the first event\n"
     "  --trace                 print every host routine call the library makes\n"
     "  --dot FILE              at the end, write every non-empty tree as one Graphviz picture\n"
+    "  --version               the library version this tool was built with\n"
     "  --help                  this text\n"
     "\n"
     "Random picks and balanced loads draw from the C runtime's rand, which the\n"
@@ -77,6 +78,9 @@ int main(int argc, char** argv) {
         if (arg == "--help" || arg == "-h") {
             std::cout << kUsage;
             return 0;
+        } else if (arg == "--version") {
+            std::cout << "sorvel-host " SORVEL_VERSION "\n";
+            return 0;
         } else if (arg == "--library" && i + 1 < argc) {
             library_path = argv[++i];
         } else if (arg == "--dot" && i + 1 < argc) {
@@ -115,8 +119,8 @@ int main(int argc, char** argv) {
         }
     }
     try {
-        auto library = library_path.empty() ? sorvel::testhost::Library::built()
-                                            : sorvel::testhost::Library::load(library_path);
+        auto library =
+            library_path.empty() ? sorvel::testhost::Library::built() : sorvel::testhost::Library::load(library_path);
         sorvel::testhost::Host host(library);
         if (seed >= 0) {
             library->seed_rand(static_cast<unsigned>(seed));
