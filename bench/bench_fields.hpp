@@ -1,7 +1,10 @@
 // A collection's fields, owned by a benchmark as a run record owns them.
 #pragma once
 
+#include <benchmark/benchmark.h>
+
 #include <cstdint>
+#include <vector>
 
 #include "collections/collections.hpp"
 
@@ -29,5 +32,17 @@ struct Fields {
     }
     Collection<V> view() { return Collection<V>{root, count, index, with_links ? &links : nullptr}; }
 };
+
+// Times Contains of every probe, and counts per probe.
+inline void time_contains(benchmark::State& state, IntegerCollection c, const std::vector<std::int32_t>& probes) {
+    for (auto _ : state) {
+        std::size_t found = 0;
+        for (const std::int32_t v : probes) {
+            found += contains(c, v) ? 1 : 0;
+        }
+        benchmark::DoNotOptimize(found);
+    }
+    state.SetItemsProcessed(static_cast<std::int64_t>(state.iterations() * probes.size()));
+}
 
 }  // namespace sorvel::bench

@@ -189,14 +189,7 @@ void BM_Contains_Integers_Sorvel(benchmark::State& state) {
     fill(f, random_integers());
     const IntegerCollection c = f.view();
     const auto& probes = integer_probes();
-    for (auto _ : state) {
-        std::size_t found = 0;
-        for (const std::int32_t v : probes) {
-            found += contains(c, v) ? 1 : 0;
-        }
-        benchmark::DoNotOptimize(found);
-    }
-    state.SetItemsProcessed(static_cast<std::int64_t>(state.iterations() * probes.size()));
+    bench::time_contains(state, c, probes);
 }
 BENCHMARK(BM_Contains_Integers_Sorvel)->Unit(benchmark::kMillisecond);
 

@@ -125,14 +125,7 @@ void BM_Deep_ContainsAfterRemovingOldest(benchmark::State& state) {
     }
     std::vector<std::int32_t> probes(values.begin() + static_cast<std::ptrdiff_t>(gone), values.end());
     std::shuffle(probes.begin(), probes.end(), std::mt19937(3));
-    for (auto _ : state) {
-        std::size_t found = 0;
-        for (const std::int32_t v : probes) {
-            found += contains(c, v) ? 1 : 0;
-        }
-        benchmark::DoNotOptimize(found);
-    }
-    state.SetItemsProcessed(static_cast<std::int64_t>(state.iterations() * probes.size()));
+    bench::time_contains(state, c, probes);
 }
 BENCHMARK(BM_Deep_ContainsAfterRemovingOldest)
     ->ArgNames({"n", "percent", "fresh"})
