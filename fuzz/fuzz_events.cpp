@@ -1,12 +1,14 @@
 // Differential fuzzer: decodes its input into events for one to three object
 // instances, runs them through the library's real handler tables by way of
-// the test host (the library linked in, so libFuzzer sees its coverage, and
-// the test host's own rand, so every draw is scripted and counted), and after
-// every event holds the library against the reference model in model.hpp:
+// the test host (the library linked in, so libFuzzer sees its coverage, or
+// one the host loaded, for the replay), with every draw scripted where the
+// generator can be scripted and learnt in advance where it cannot. After
+// every event it holds the library against the reference model in model.hpp:
 // results, counts, result flags, host calls and their arguments, draws and
 // the header bytes the library may not touch; tree shapes every few events,
-// insertion order in sweeps, and both at the end of every input. Any difference aborts with a description of the
-// event and the ones before it, and libFuzzer keeps the input.
+// insertion order in sweeps, and both at the end of every input. Any
+// difference aborts with a description of the event and the ones before it,
+// and libFuzzer keeps the input.
 //
 // Input: one byte for the number of instances, then per instance a byte of
 // option words and two bytes of a creation word; then events, one byte each
