@@ -15,6 +15,7 @@
 #include <string>
 #include <vector>
 
+#include "support.hpp"
 #include "test_host.hpp"
 
 namespace {
@@ -97,18 +98,13 @@ TEST(ProductDll, DrawsFromMsvcrtsGenerator) {
 
 // The strings in order and both counts: all a failure may change.
 std::string contents(Instance& instance) {
-    std::string out = std::to_string(instance.count(0)) + "/" + std::to_string(instance.count(2)) + ":";
-    std::vector<NodeView> pending{NodeView{instance.root(2)}};
-    while (!pending.empty()) {  // preorder: equal texts, equal trees
-        const NodeView n = pending.back();
-        pending.pop_back();
-        out += n ? n.string() + " " : "- ";
-        if (n) {
-            pending.push_back(n.right());
-            pending.push_back(n.left());
-        }
-    }
-    return out;
+    return std::to_string(instance.count(0)) + "/" + std::to_string(instance.count(2)) + ":" +
+           sorvel::test::preorder(
+               instance.root(2), sorvel::testhost::word{0},
+               [](sorvel::testhost::word n) {
+                   return std::pair{NodeView{n}.left().address, NodeView{n}.right().address};
+               },
+               [](sorvel::testhost::word n) { return NodeView{n}.string(); });
 }
 
 TEST(ProductDll, EveryAllocationOfAnAddOrALoadMayFail) {
