@@ -7,12 +7,18 @@
 namespace sorvel {
 namespace {
 
-#ifndef SORVEL_DESCENT_BOUND
-#define SORVEL_DESCENT_BOUND 128
+// The depth past which plain descents call for a side structure. Random
+// trees stay near 1.39 log2 n deep on average and below 3 log2 n at worst,
+// so they never reach it; degenerate shapes of every size do. Test builds
+// fix a small bound, so that small collections run through the structure.
+std::uint32_t descent_bound(std::int32_t count) noexcept {
+#ifdef SORVEL_DESCENT_BOUND
+    static_cast<void>(count);
+    return SORVEL_DESCENT_BOUND;
+#else
+    return 3 * static_cast<std::uint32_t>(std::bit_width(static_cast<std::uint32_t>(count))) + 8;
 #endif
-// Random trees of millions of values stay well below this depth; deeper
-// descents mean a degenerate shape worth a side structure.
-constexpr std::uint32_t kDescentBound = SORVEL_DESCENT_BOUND;
+}
 
 // Where a key sits: the link pointing at its node, or the null link where it
 // would hang. With a side structure, also its entry and, for a node with a
@@ -43,11 +49,11 @@ Place<TreeNode<V>> locate(const Collection<V>& c, const Key& key, const Order& o
     }
     std::uint32_t depth = 0;
     Node** link = TreeSteps<Node>::descend(c.root, key, order, depth);
-    if (depth > kDescentBound && links != nullptr && links->may_build(c.count)) {
-        links->build(c.root, c.count);
-        if (links->built()) {
+    if (depth > descent_bound(c.count) && links != nullptr && links->may_build(depth)) {
+        if (links->build(c.root, c.count, descent_bound(c.count)) && links->built()) {
             return locate(c, key, order);
         }
+        links->give_up(c.count);
     }
     return {link};
 }
@@ -119,6 +125,9 @@ bool remove_key(Collection<V>& c, const Key& key, const Order& order) noexcept {
     // A string's characters share the node's block, so one release frees both.
     memory::release(removed);
     --c.count;
+    if (place.entry != LinkIndex<Node>::kNone) {
+        c.links->fit(c.root, c.count, descent_bound(c.count));
+    }
     return true;
 }
 

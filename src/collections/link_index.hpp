@@ -3,13 +3,12 @@
 // right). It lets a deep tree be searched, grown and pruned in O(log n) while
 // the tree itself keeps exactly the shape plain descents give it.
 //
-// It is a treap over one pooled array of entries. Priorities are a level
-// (trailing zeros of a draw, geometric like a skip list's) above random low
-// bits, so a tree built from sorted values with level = trailing zeros of the
-// rank is a valid treap of the same distribution.
+// It is a treap over one pooled array of entries, every entry with a random
+// priority, so its expected depth is about 1.39 log2 n after any sequence of
+// operations: the shape depends only on the keys held and on priorities that
+// no order of Adds and Removes can see.
 #pragma once
 
-#include <bit>
 #include <cstdint>
 #include <cstring>
 
@@ -44,66 +43,74 @@ public:
     ~LinkIndex() { memory::release(pool_); }
 
     [[nodiscard]] bool built() const noexcept { return pool_ != nullptr; }
-    [[nodiscard]] bool may_build(std::int32_t count) const noexcept { return count >= retry_at_; }
     [[nodiscard]] Node** link(std::uint32_t e) const noexcept { return pool_[e].link; }
     void relink(std::uint32_t e, Node** to) noexcept { pool_[e].link = to; }
 
-    // Forgets everything; `retry_at` is the count before which no rebuild is
-    // tried, so that memory pressure does not cost an O(n) pass per call.
-    void drop(std::int32_t retry_at = 0) noexcept {
-        memory::release(pool_);
-        pool_ = nullptr;
-        capacity_ = used_ = 0;
-        free_ = root_ = kNone;
-        retry_at_ = retry_at;
+    // For inspection: the top entry, the entries in use, an entry.
+    [[nodiscard]] std::uint32_t root() const noexcept { return root_; }
+    [[nodiscard]] std::uint32_t size() const noexcept { return size_; }
+    [[nodiscard]] std::uint32_t capacity() const noexcept { return capacity_; }
+    [[nodiscard]] const Entry& entry(std::uint32_t e) const noexcept { return pool_[e]; }
+
+    // Whether a descent of `depth` nodes, too deep for plain descents, may
+    // start a build. After memory ran out, builds wait until descents have
+    // passed as many nodes as the count: the retry then costs no more than
+    // the descents it saves, and a failure that passes costs O(n) once.
+    [[nodiscard]] bool may_build(std::uint32_t depth) noexcept {
+        if (wait_ <= depth) {
+            wait_ = 0;
+            return true;
+        }
+        wait_ -= depth;
+        return false;
     }
 
-    // Used when memory ran out: plain descents until the count has doubled.
-    void give_up(std::int32_t count) noexcept { drop(count > 0x3FFFFFFF ? 0x7FFFFFFF : 2 * count); }
+    // Forgets everything.
+    void drop() noexcept {
+        memory::release(pool_);
+        pool_ = nullptr;
+        capacity_ = used_ = size_ = 0;
+        free_ = root_ = kNone;
+    }
 
-    // One in-order pass over the tree without recursion: the links still to
-    // visit wait at the far end of the pool, which they never overlap with
-    // the entries already written, since both are distinct nodes.
-    void build(Node*& root, std::int32_t count) noexcept {
+    // Used when memory ran out: plain descents for a while.
+    void give_up(std::int32_t count) noexcept {
+        drop();
+        wait_ = count < 1 ? 1U : static_cast<std::uint32_t>(count);
+    }
+
+    // Builds the structure over the tree in O(n), replacing any held one.
+    // A tree no deeper than `shallow` gets none. False, with what was held
+    // kept, when memory ran out.
+    bool build(Node*& root, std::int32_t count, std::uint32_t shallow) noexcept {
         const auto n = static_cast<std::uint32_t>(count);
-        const std::uint32_t capacity = n + n / 2 + 16;
+        const std::uint32_t capacity = n + n / 8 + 16;
+        Entry* pool = nullptr;
         if (capacity < n || capacity > 0xFFFFFFFFU / sizeof(Entry) ||
-            (pool_ = static_cast<Entry*>(memory::allocate(sizeof(Entry) * capacity))) == nullptr) {
-            give_up(count);
-            return;
+            (pool = static_cast<Entry*>(memory::allocate(sizeof(Entry) * capacity))) == nullptr) {
+            return false;
         }
+        if (gather(pool, n, root) <= shallow) {
+            memory::release(pool);
+            drop();
+            return true;
+        }
+        memory::release(pool_);
+        pool_ = pool;
         capacity_ = capacity;
-        std::uint32_t done = 0;
-        std::uint32_t waiting = 0;
-        for (Node** at = &root;;) {
-            for (; *at != nullptr; at = &(*at)->left) {
-                pool_[n - ++waiting].link = at;
-            }
-            if (waiting == 0) {
-                break;
-            }
-            at = pool_[n - waiting--].link;
-            pool_[done++] = Entry{at, (*at)->value, kNone, kNone, 0};
-            at = &(*at)->right;
+        used_ = size_ = n;
+        free_ = kNone;
+        root_ = cartesian(n);
+        return true;
+    }
+
+    // Once no more than a quarter of the entries are in use, the structure is
+    // rebuilt to fit, or dropped if the tree is shallow again; kept as it is
+    // when memory runs out.
+    void fit(Node*& root, std::int32_t count, std::uint32_t shallow) noexcept {
+        if (size_ <= capacity_ / 4 && capacity_ > 64) {
+            build(root, count, shallow);
         }
-        // Rank r (from 1) gets level trailing_zeros(r): a perfectly balanced
-        // treap whose children are found by halving steps.
-        for (std::uint32_t r = 1; r <= n; ++r) {
-            const int level = std::countr_zero(r);
-            Entry& e = pool_[r - 1];
-            e.priority = static_cast<std::uint32_t>(level) << 27;
-            if (level > 0) {
-                const std::uint32_t half = 1U << (level - 1);
-                e.left = r - half - 1;
-                std::uint32_t child = r + half;
-                while (child > n && (child & 1U) == 0) {
-                    child -= 1U << (std::countr_zero(child) - 1);
-                }
-                e.right = child > n ? kNone : child - 1;
-            }
-        }
-        used_ = n;
-        root_ = n == 0 ? kNone : std::bit_floor(n) - 1;
     }
 
     template <class Key, class Order>
@@ -130,7 +137,7 @@ public:
         return f;
     }
 
-    // False when the pool cannot grow; the caller then drops the structure.
+    // False when the pool cannot grow; the caller then gives up.
     template <class Order>
     bool insert(Node** at, const Order& order) noexcept {
         if (free_ == kNone && used_ == capacity_ && !grow()) {
@@ -142,11 +149,8 @@ public:
         } else {
             x = used_++;
         }
-        seed_ ^= seed_ << 13;
-        seed_ ^= seed_ >> 17;
-        seed_ ^= seed_ << 5;
-        const auto level = static_cast<std::uint32_t>(std::countr_zero(seed_ | 0x80000000U));
-        pool_[x] = Entry{at, (*at)->value, kNone, kNone, (level << 27) | ((seed_ * 2654435761U) >> 5)};
+        ++size_;
+        pool_[x] = Entry{at, (*at)->value, kNone, kNone, next_priority()};
         std::uint32_t* slot = &root_;
         while (*slot != kNone && pool_[*slot].priority > pool_[x].priority) {
             slot = order(pool_[x].key, pool_[*slot].key) > 0 ? &pool_[*slot].right : &pool_[*slot].left;
@@ -193,9 +197,76 @@ public:
         *slot = a != kNone ? a : b;
         pool_[x].left = free_;
         free_ = x;
+        --size_;
     }
 
 private:
+    // xorshift32: cheap, and apart from the C runtime's generator, whose
+    // draws belong to the random picks and balanced loads.
+    std::uint32_t next_priority() noexcept {
+        seed_ ^= seed_ << 13;
+        seed_ ^= seed_ >> 17;
+        seed_ ^= seed_ << 5;
+        return seed_;
+    }
+
+    // Writes the n links of the tree in order into pool[0, n) and gives the
+    // tree's depth in nodes. One pass without recursion: the links still to
+    // visit wait at the far end of the pool, with their depth in `priority`,
+    // and never overlap the entries written, since both are distinct nodes.
+    static std::uint32_t gather(Entry* pool, std::uint32_t n, Node*& root) noexcept {
+        std::uint32_t done = 0;
+        std::uint32_t waiting = 0;
+        std::uint32_t depth = 0;
+        std::uint32_t deepest = 0;
+        for (Node** at = &root;;) {
+            for (; *at != nullptr; at = &(*at)->left) {
+                Entry& wait = pool[n - ++waiting];
+                wait.link = at;
+                wait.priority = ++depth;
+            }
+            if (waiting == 0) {
+                break;
+            }
+            const Entry& next = pool[n - waiting--];
+            at = next.link;
+            depth = next.priority;
+            deepest = depth > deepest ? depth : deepest;
+            pool[done++] = Entry{at, (*at)->value, kNone, kNone, 0};
+            at = &(*at)->right;
+        }
+        return deepest;
+    }
+
+    // Random priorities over the n ordered entries, and the treap they make,
+    // in O(n): the right spine is kept as a stack linked upwards through
+    // `right`, and turned back down at the end.
+    std::uint32_t cartesian(std::uint32_t n) noexcept {
+        std::uint32_t top = kNone;
+        for (std::uint32_t i = 0; i < n; ++i) {
+            Entry& e = pool_[i];
+            e.priority = next_priority();
+            std::uint32_t below = kNone;
+            while (top != kNone && pool_[top].priority < e.priority) {
+                const std::uint32_t up = pool_[top].right;
+                pool_[top].right = below;
+                below = top;
+                top = up;
+            }
+            e.left = below;
+            e.right = top;
+            top = i;
+        }
+        std::uint32_t below = kNone;
+        while (top != kNone) {
+            const std::uint32_t up = pool_[top].right;
+            pool_[top].right = below;
+            below = top;
+            top = up;
+        }
+        return below;
+    }
+
     bool grow() noexcept {
         const std::uint32_t bigger = capacity_ + capacity_ / 2 + 16;
         if (bigger < capacity_ || bigger > 0xFFFFFFFFU / sizeof(Entry)) {
@@ -214,11 +285,12 @@ private:
 
     Entry* pool_ = nullptr;
     std::uint32_t capacity_ = 0;
-    std::uint32_t used_ = 0;
+    std::uint32_t used_ = 0;  // entries handed out, freed ones included
+    std::uint32_t size_ = 0;  // entries in use
     std::uint32_t free_ = kNone;
     std::uint32_t root_ = kNone;
     std::uint32_t seed_ = 0x9E3779B9U;
-    std::int32_t retry_at_ = 0;
+    std::uint32_t wait_ = 0;  // nodes descents must pass before a build
 };
 
 }  // namespace sorvel
