@@ -34,6 +34,23 @@ inline constexpr std::size_t kOpenFile = 80;
 inline constexpr std::size_t kCloseFile = 81;
 }  // namespace host_words
 
+// The fixed answers the host reads at start-up. Their meaning is the host's;
+// the library only gives them.
+namespace answers {
+struct InfoAnswer {
+    std::int32_t code;
+    std::int32_t answer;
+};
+// GetInfos: the codes with an answer; every other code gives 0.
+inline constexpr InfoAnswer kInfos[] = {{0, 768}, {2, 256}, {6, 2}, {7, 247}};
+inline constexpr std::int32_t kHandleRunObject = 2;
+// The ObjectInfoBlock's constant fields.
+inline constexpr std::uint32_t kInfoFlags = 2305;
+inline constexpr char kInfoLetter = 'd';
+inline constexpr std::uint32_t kIdentifier = 0x5352564C;  // "SRVL", 'S' in the most significant byte
+inline constexpr std::uint16_t kVersion = 1;
+}  // namespace answers
+
 // Result flags at byte 124 of the RunRecord.
 inline constexpr std::uint16_t kFloatResultFlag = 0x4000;
 inline constexpr std::uint16_t kStringResultFlag = 0x8000;

@@ -16,13 +16,12 @@ SORVEL_EXPORT word SORVEL_CALL DllMain(word, word, word) {
 }
 
 SORVEL_EXPORT word SORVEL_CALL GetInfos(word code) {
-    switch (code) {
-        case 0: return 768;
-        case 2: return 256;
-        case 6: return 2;
-        case 7: return 247;
-        default: return 0;
+    for (const auto& info : sorvel::answers::kInfos) {
+        if (code == info.code) {
+            return info.answer;
+        }
     }
+    return 0;
 }
 
 SORVEL_EXPORT word SORVEL_CALL GetRunObjectInfos(word, word block_word) {
@@ -38,11 +37,11 @@ SORVEL_EXPORT word SORVEL_CALL GetRunObjectInfos(word, word block_word) {
     block->action_count = static_cast<std::uint16_t>(cat::kActionCount);
     block->expression_count = static_cast<std::uint16_t>(cat::kExpressionCount);
     block->edit_record_size = sizeof(sorvel::EditRecord);
-    block->flags = 2305;
-    block->letter = 'd';
+    block->flags = sorvel::answers::kInfoFlags;
+    block->letter = sorvel::answers::kInfoLetter;
     block->zero = 0;
-    block->identifier = 0x5352564C;  // 'SRVL'
-    block->version = 1;
+    block->identifier = sorvel::answers::kIdentifier;
+    block->version = sorvel::answers::kVersion;
     return 1;
 }
 
@@ -115,7 +114,7 @@ SORVEL_EXPORT word SORVEL_CALL DestroyRunObject(word record_word, word) {
 }
 
 SORVEL_EXPORT word SORVEL_CALL HandleRunObject(word) {
-    return 2;
+    return sorvel::answers::kHandleRunObject;
 }
 
 // Stubs: each reads none of its arguments. Those whose answer the host leaves

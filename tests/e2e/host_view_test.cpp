@@ -28,6 +28,7 @@ using sorvel::testhost::RecordLayout;
 using sorvel::testhost::word;
 using Routine = HostCall::Routine;
 namespace catalogue = sorvel::catalogue;
+namespace answers = sorvel::answers;
 
 template <class T>
 T at(const unsigned char* bytes, std::size_t offset) {
@@ -61,12 +62,12 @@ TEST_F(HostTest, InformationBlockAndHandlerTables) {
         EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoCounts + 2), 10);
         EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoCounts + 4), 12);
         EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoCounts + 6), 28) << "EditRecord size";
-        EXPECT_EQ(at<std::int32_t>(b, RecordLayout::kInfoFlags), 2305);
-        EXPECT_EQ(b[RecordLayout::kInfoLetter], 'd');
+        EXPECT_EQ(at<std::uint32_t>(b, RecordLayout::kInfoFlags), answers::kInfoFlags);
+        EXPECT_EQ(b[RecordLayout::kInfoLetter], answers::kInfoLetter);
         EXPECT_EQ(b[RecordLayout::kInfoUntouched], fill) << "byte 25 is the host's";
         EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoZero), 0);
         EXPECT_EQ(std::string(reinterpret_cast<const char*>(b) + RecordLayout::kInfoIdentifier, 4), "LVRS");
-        EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoVersion), 1);
+        EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoVersion), answers::kVersion);
         EXPECT_EQ(b[RecordLayout::kInfoSize], fill) << "nothing written beyond the block";
     }
     // Every handler once, each table ending in a null; later loader calls

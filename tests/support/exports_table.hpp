@@ -6,6 +6,8 @@
 #include <array>
 #include <cstdint>
 
+#include "host/abi.hpp"
+
 namespace sorvel::test {
 
 struct ExportEntry {
@@ -101,10 +103,6 @@ inline constexpr std::array<ExportEntry, 74> kExports{{
 }};
 
 // GetInfos: the codes with an answer; every other code gives 0.
-struct InfoAnswer {
-    std::int32_t code;
-    std::int32_t answer;
-};
-inline constexpr std::array<InfoAnswer, 4> kInfoAnswers{{{0, 768}, {2, 256}, {6, 2}, {7, 247}}};
+inline constexpr const auto& kInfoAnswers = answers::kInfos;
 
 }  // namespace sorvel::test
