@@ -89,52 +89,6 @@ TEST_F(HostTest, InformationBlockAndHandlerTables) {
     EXPECT_EQ(host.tables().actions, first.actions);
 }
 
-TEST(Catalogue, DisplayStringsTitlesAndNumbering) {
-    struct Row {
-        const char* display;
-        int number;
-        const char* titles;
-    };
-    const std::array<Row, 25> rows{{
-        {"%o: Contains Integer: %0", 0, "Enter Integer"},
-        {"%o: Contains Float: %0", 1, "Enter Float"},
-        {"%o: Contains String: %0", 2, "Enter String"},
-        {"Add Integer: %0", 0, "Enter Integer"},
-        {"Remove Integer: %0", 1, "Enter Integer"},
-        {"Clear Integers", 2, ""},
-        {"Add Float: %0", 3, "Enter Float"},
-        {"Remove Float: %0", 4, "Enter Float"},
-        {"Clear Floats", 5, ""},
-        {"Add String: %0", 6, "Enter String"},
-        {"Remove String: %0", 7, "Enter String"},
-        {"Clear Strings", 8, ""},
-        {"Load From File: %0 into Strings (Balance: %1)", 9, "Enter Text File|Balance? (1 = Yes, 0 = No)"},
-        {"IntegersSize(", 0, ""},
-        {"IntegersRandomElement(", 1, ""},
-        {"FloatsSize(", 2, ""},
-        {"FloatsRandomElement(", 3, ""},
-        {"StringsSize(", 4, ""},
-        {"StringsRandomElement$(", 5, ""},
-        {"IndexOfIntegerElement(", 6, "Enter Integer Element"},
-        {"IntegerElementAt(", 7, "Enter Index of Integer"},
-        {"IndexOfFloatElement(", 8, "Enter Float Element"},
-        {"FloatElementAt(", 9, "Enter Index of Float"},
-        {"IndexOfStringElement(", 10, "Enter String Element"},
-        {"StringElementAt$(", 11, "Enter Index of String"},
-    }};
-    for (std::size_t i = 0; i < rows.size(); ++i) {
-        const catalogue::Event& e = catalogue::kEvents[i];
-        std::string titles;
-        for (std::size_t p = 0; p < e.param_count; ++p) {
-            titles += (p == 0 ? "" : "|") + std::string(e.params[p].title);
-        }
-        EXPECT_EQ(e.display, rows[i].display);
-        EXPECT_EQ(e.number, rows[i].number) << rows[i].display;
-        EXPECT_EQ(titles, rows[i].titles) << rows[i].display;
-    }
-    EXPECT_STREQ(catalogue::kOptions[1].name, "Use Indicies");
-}
-
 // An instance whose reader or indexes could not be had still serves every
 // event, as with the option off, and destruction frees what was had.
 TEST(Creation, WithoutMemoryEveryEventStillWorks) {
