@@ -3,10 +3,11 @@
 // removal leaves an empty slot rather than moving the later ones, and a
 // RankedBits over the slots turns slots into positions and back.
 //
-// Memory follows the count: once empty slots outnumber the held ones, the
-// held entries move to the front; once a quarter of the capacity or less is
-// held, they move to a block half the size (if one can be had); Clear gives
-// the block back.
+// Memory follows the count. A full block whose empty slots are more than a
+// quarter of those handed out is packed in place instead of grown. A removal
+// that leaves a quarter of the capacity or less held moves the entries to a
+// block twice their number, if one can be had, and one that leaves more
+// empty slots than held ones packs them. Clear gives the block back.
 #pragma once
 
 #include <cstdint>

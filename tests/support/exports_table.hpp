@@ -1,6 +1,6 @@
 // What a host expects of the library's exports, written out once for the
 // tests: name, ordinal, argument count and, for a stub, its fixed answer.
-// The boundary test, the DLL check and the fuzzer's driver all read it.
+// The end-to-end tests, the DLL check and the fuzzer's driver all read it.
 #pragma once
 
 #include <array>
