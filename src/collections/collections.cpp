@@ -20,47 +20,54 @@ std::uint32_t descent_bound(std::int32_t count) noexcept {
 #endif
 }
 
-// Where a key sits: the link pointing at its node, or the null link where it
-// would hang. With a side structure, also its entry and, for a node with a
-// left subtree, that subtree's largest node.
+// Where a key sits. `link` points at the link to its node or, for a search
+// made to add, at the null link where it would hang; it is null when the
+// side structure answered that the key is absent and no leaf was asked for.
+// With the side structure, also what its search found.
 template <class Node>
 struct Place {
+    static constexpr std::uint32_t kNone = LinkIndex<Node>::kNone;
     Node** link;
-    std::uint32_t entry = LinkIndex<Node>::kNone;
-    Node* below = nullptr;
+    bool held;
+    typename LinkIndex<Node>::Found found = {};  // found.match: the key's entry, or none
 };
 
+enum class Search : bool { value, leaf };
+
 template <class V, class Key, class Order>
-Place<TreeNode<V>> locate(const Collection<V>& c, const Key& key, const Order& order) noexcept {
+Place<TreeNode<V>> locate(const Collection<V>& c, const Key& key, const Order& order, Search search) noexcept {
     using Node = TreeNode<V>;
     LinkIndex<Node>* links = c.links;
     if (links != nullptr && links->built()) {
         const auto f = links->find(key, order);
-        Node* below = f.below == links->kNone ? nullptr : *links->link(f.below);
         if (f.match != links->kNone) {
-            return {links->link(f.match), f.match, below};
+            return {links->link(f.match), true, f};
+        }
+        if (search == Search::value) {
+            return {nullptr, false};
         }
         // A new leaf hangs from its predecessor's right link or, when that is
         // taken, from its successor's left link.
+        Node* below = f.below == links->kNone ? nullptr : *links->link(f.below);
         if (below != nullptr && below->right == nullptr) {
-            return {&below->right};
+            return {&below->right, false};
         }
-        return {f.above == links->kNone ? &c.root : &(*links->link(f.above))->left};
+        return {f.above == links->kNone ? &c.root : &(*links->link(f.above))->left, false};
     }
     std::uint32_t depth = 0;
     Node** link = TreeSteps<Node>::descend(c.root, key, order, depth);
     if (depth > descent_bound(c.count) && links != nullptr && links->may_build(depth)) {
-        if (links->build(c.root, c.count, descent_bound(c.count)) && links->built()) {
-            return locate(c, key, order);
+        if (links->build(c.root, c.count)) {
+            return locate(c, key, order, search);
         }
         links->give_up(c.count);
     }
-    return {link};
+    return {link, *link != nullptr};
 }
 
 template <class V, class Key, class Order>
 bool contains_key(const Collection<V>& c, const Key& key, const Order& order) noexcept {
-    return *locate(c, key, order).link != nullptr;
+    return locate(c, key, order, Search::value).held;
 }
 
 // Leaf insertion. The node is made only once the value is known to be new
@@ -69,10 +76,11 @@ bool contains_key(const Collection<V>& c, const Key& key, const Order& order) no
 template <class V, class Key, class Order, class Make>
 bool add_key(Collection<V>& c, const Key& key, const Order& order, Make&& make) noexcept {
     using Node = TreeNode<V>;
-    Node** link = locate(c, key, order).link;
-    if (*link != nullptr) {
+    const Place<Node> place = locate(c, key, order, Search::leaf);
+    if (place.held) {
         return false;
     }
+    Node** link = place.link;
     if (c.index != nullptr && !c.index->reserve_one()) {
         return false;
     }
@@ -97,21 +105,23 @@ bool add_key(Collection<V>& c, const Key& key, const Order& order, Make&& make) 
 template <class V, class Key, class Order>
 bool remove_key(Collection<V>& c, const Key& key, const Order& order) noexcept {
     using Node = TreeNode<V>;
-    const Place<Node> place = locate(c, key, order);
-    Node* removed = *place.link;
-    if (removed == nullptr) {
+    const Place<Node> place = locate(c, key, order, Search::value);
+    if (!place.held) {
         return false;
     }
+    Node* removed = *place.link;
     Node* smaller = removed->left;
     Node* larger = removed->right;
-    Node* below = place.below;
-    if (smaller != nullptr && larger != nullptr && below == nullptr) {
-        below = TreeSteps<Node>::largest(smaller);
+    Node* below = nullptr;
+    if (smaller != nullptr && larger != nullptr) {
+        // The largest smaller key is the left subtree's largest node.
+        below = place.found.match != Place<Node>::kNone ? *c.links->link(c.links->below(place.found))
+                                                        : TreeSteps<Node>::largest(smaller);
     }
     TreeSteps<Node>::detach(place.link, below);
     // Only the two children now hang from other links.
-    if (place.entry != LinkIndex<Node>::kNone) {
-        c.links->erase(place.entry, order);
+    if (place.found.match != Place<Node>::kNone) {
+        c.links->erase(place.found.match, place.found.parent);
         if (smaller != nullptr) {
             c.links->relink(c.links->find(smaller->value, order).match, place.link);
         }
@@ -125,8 +135,8 @@ bool remove_key(Collection<V>& c, const Key& key, const Order& order) noexcept {
     // A string's characters share the node's block, so one release frees both.
     memory::release(removed);
     --c.count;
-    if (place.entry != LinkIndex<Node>::kNone) {
-        c.links->fit(c.root, c.count, descent_bound(c.count));
+    if (place.found.match != Place<Node>::kNone) {
+        c.links->fit();
     }
     return true;
 }
@@ -155,8 +165,8 @@ std::int32_t position_of_key(const Collection<V>& c, const Key& key, const Order
     if (c.index == nullptr || c.index->empty()) {
         return -1;
     }
-    const TreeNode<V>* node = *locate(c, key, order).link;
-    return node == nullptr ? -1 : c.index->position_of(node);
+    const Place<TreeNode<V>> place = locate(c, key, order, Search::value);
+    return place.held ? c.index->position_of(*place.link) : -1;
 }
 
 template <class V>

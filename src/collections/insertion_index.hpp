@@ -5,9 +5,10 @@
 //
 // Memory follows the count. A full block whose empty slots are more than a
 // quarter of those handed out is packed in place instead of grown. A removal
-// that leaves a quarter of the capacity or less held moves the entries to a
-// block twice their number, if one can be had, and one that leaves more
-// empty slots than held ones packs them. Clear gives the block back.
+// that leaves a third of the capacity or less held moves the entries to a
+// block half as large again as their number, if one can be had, and one that
+// leaves more empty slots than held ones packs them. Clear gives the block
+// back.
 #pragma once
 
 #include <cstdint>
@@ -70,7 +71,7 @@ public:
         if (capacity_ >= kMax) {
             return false;
         }
-        std::uint32_t grown = capacity_ < kSmallest ? kSmallest : (capacity_ + capacity_ / 2 + 1) / 2 * 2;
+        std::uint32_t grown = roomy(capacity_);
         grown = grown > kMax || grown < capacity_ ? kMax : grown;
         return move_to(grown);
     }
@@ -104,7 +105,7 @@ public:
         }
         // Shrinking is best-effort: without a smaller block the entries are
         // packed where they are.
-        if (size_ <= capacity_ / 4 && capacity_ > kSmallest && move_to(2 * size_ < kSmallest ? kSmallest : 2 * size_)) {
+        if (size_ <= capacity_ / 3 && capacity_ > kSmallest && move_to(roomy(size_))) {
             return;
         }
         if (used_ - size_ > size_) {
@@ -124,6 +125,12 @@ public:
 private:
     static constexpr std::uint32_t kNoCursor = std::numeric_limits<std::uint32_t>::max();
     static constexpr std::uint32_t kSmallest = 8;
+
+    // Room for n entries and half as many again, even.
+    static std::uint32_t roomy(std::uint32_t n) noexcept {
+        const std::uint32_t room = (n + n / 2 + 1) / 2 * 2;
+        return room < kSmallest ? kSmallest : room;
+    }
 
     // One block: the slots, then the bits and counts (8-byte aligned, as the
     // capacity is even).

@@ -33,8 +33,9 @@ public:
     // What a search found: the matching entry, or the neighbours of the key.
     struct Found {
         std::uint32_t match = kNone;
-        std::uint32_t below = kNone;  // largest entry smaller than the key
-        std::uint32_t above = kNone;  // smallest entry larger than the key
+        std::uint32_t parent = kNone;  // the entry whose child the match is
+        std::uint32_t below = kNone;   // the last entry passed on the left, or the largest smaller
+        std::uint32_t above = kNone;   // smallest entry larger than the key
     };
 
     LinkIndex() noexcept = default;
@@ -79,38 +80,54 @@ public:
         wait_ = count < 1 ? 1U : static_cast<std::uint32_t>(count);
     }
 
-    // Builds the structure over the tree in O(n), replacing any held one.
-    // A tree no deeper than `shallow` gets none. False, with what was held
-    // kept, when memory ran out.
-    bool build(Node*& root, std::int32_t count, std::uint32_t shallow) noexcept {
+    // Builds the structure over the tree in O(n). False, with nothing held,
+    // when memory ran out.
+    bool build(Node*& root, std::int32_t count) noexcept {
+        drop();
         const auto n = static_cast<std::uint32_t>(count);
         const std::uint32_t capacity = n + n / 8 + 16;
-        Entry* pool = nullptr;
         if (capacity < n || capacity > 0xFFFFFFFFU / sizeof(Entry) ||
-            (pool = static_cast<Entry*>(memory::allocate(sizeof(Entry) * capacity))) == nullptr) {
+            (pool_ = static_cast<Entry*>(memory::allocate(sizeof(Entry) * capacity))) == nullptr) {
             return false;
         }
-        if (gather(pool, n, root) <= shallow) {
-            memory::release(pool);
-            drop();
-            return true;
-        }
-        memory::release(pool_);
-        pool_ = pool;
+        gather(pool_, n, root);
         capacity_ = capacity;
         used_ = size_ = n;
-        free_ = kNone;
         root_ = cartesian(n);
         return true;
     }
 
-    // Once no more than a quarter of the entries are in use, the structure is
-    // rebuilt to fit, or dropped if the tree is shallow again; kept as it is
+    // Once half the entries or fewer are in use, those in use move to a
+    // block that fits them, in two passes over the pool; kept as they are
     // when memory runs out.
-    void fit(Node*& root, std::int32_t count, std::uint32_t shallow) noexcept {
-        if (size_ <= capacity_ / 4 && capacity_ > 64) {
-            build(root, count, shallow);
+    void fit() noexcept {
+        if (size_ > capacity_ / 2 || capacity_ <= 64) {
+            return;
         }
+        const std::uint32_t capacity = size_ + size_ / 8 + 16;
+        auto* pool = static_cast<Entry*>(memory::allocate(sizeof(Entry) * capacity));
+        if (pool == nullptr) {
+            return;
+        }
+        // Each entry in use is copied; its old place keeps its new number.
+        std::uint32_t kept = 0;
+        for (std::uint32_t e = 0; e < used_; ++e) {
+            if (pool_[e].link != nullptr) {
+                pool[kept] = pool_[e];
+                pool_[e].priority = kept++;
+            }
+        }
+        auto renumber = [this](std::uint32_t e) noexcept { return e == kNone ? kNone : pool_[e].priority; };
+        for (std::uint32_t e = 0; e < kept; ++e) {
+            pool[e].left = renumber(pool[e].left);
+            pool[e].right = renumber(pool[e].right);
+        }
+        root_ = renumber(root_);
+        memory::release(pool_);
+        pool_ = pool;
+        capacity_ = capacity;
+        used_ = kept;
+        free_ = kNone;
     }
 
     template <class Key, class Order>
@@ -120,12 +137,9 @@ public:
             const int c = order(key, pool_[e].key);
             if (c == 0) {
                 f.match = e;
-                // The neighbours, as a removal with two subtrees needs the one below.
-                for (std::uint32_t l = pool_[e].left; l != kNone; l = pool_[l].right) {
-                    f.below = l;
-                }
                 return f;
             }
+            f.parent = e;
             if (c > 0) {
                 f.below = e;
                 e = pool_[e].right;
@@ -134,7 +148,19 @@ public:
                 e = pool_[e].left;
             }
         }
+        f.parent = kNone;
         return f;
+    }
+
+    // The entry of the largest key below a match: the end of the right spine
+    // of its left subtree, or else the last entry the search passed on the
+    // left.
+    [[nodiscard]] std::uint32_t below(const Found& f) const noexcept {
+        std::uint32_t below = f.below;
+        for (std::uint32_t l = pool_[f.match].left; l != kNone; l = pool_[l].right) {
+            below = l;
+        }
+        return below;
     }
 
     // False when the pool cannot grow; the caller then gives up.
@@ -174,12 +200,11 @@ public:
         return true;
     }
 
-    template <class Order>
-    void erase(std::uint32_t x, const Order& order) noexcept {
-        std::uint32_t* slot = &root_;
-        while (*slot != x) {
-            slot = order(pool_[x].key, pool_[*slot].key) > 0 ? &pool_[*slot].right : &pool_[*slot].left;
-        }
+    // Takes out entry x, whose parent find() gave.
+    void erase(std::uint32_t x, std::uint32_t parent) noexcept {
+        std::uint32_t* slot = parent == kNone           ? &root_
+                              : pool_[parent].left == x ? &pool_[parent].left
+                                                        : &pool_[parent].right;
         // The two subtrees merge by priority in place of the entry.
         std::uint32_t a = pool_[x].left;
         std::uint32_t b = pool_[x].right;
@@ -195,6 +220,7 @@ public:
             }
         }
         *slot = a != kNone ? a : b;
+        pool_[x].link = nullptr;  // marks a free entry
         pool_[x].left = free_;
         free_ = x;
         --size_;
@@ -210,32 +236,24 @@ private:
         return seed_;
     }
 
-    // Writes the n links of the tree in order into pool[0, n) and gives the
-    // tree's depth in nodes. One pass without recursion: the links still to
-    // visit wait at the far end of the pool, with their depth in `priority`,
-    // and never overlap the entries written, since both are distinct nodes.
-    static std::uint32_t gather(Entry* pool, std::uint32_t n, Node*& root) noexcept {
+    // Writes the n links of the tree in order into pool[0, n). One pass
+    // without recursion: the links still to visit wait at the far end of the
+    // pool, which they never overlap with the entries already written, since
+    // both are distinct nodes.
+    static void gather(Entry* pool, std::uint32_t n, Node*& root) noexcept {
         std::uint32_t done = 0;
         std::uint32_t waiting = 0;
-        std::uint32_t depth = 0;
-        std::uint32_t deepest = 0;
         for (Node** at = &root;;) {
             for (; *at != nullptr; at = &(*at)->left) {
-                Entry& wait = pool[n - ++waiting];
-                wait.link = at;
-                wait.priority = ++depth;
+                pool[n - ++waiting].link = at;
             }
             if (waiting == 0) {
                 break;
             }
-            const Entry& next = pool[n - waiting--];
-            at = next.link;
-            depth = next.priority;
-            deepest = depth > deepest ? depth : deepest;
+            at = pool[n - waiting--].link;
             pool[done++] = Entry{at, (*at)->value, kNone, kNone, 0};
             at = &(*at)->right;
         }
-        return deepest;
     }
 
     // Random priorities over the n ordered entries, and the treap they make,
