@@ -14,6 +14,7 @@
 #include <cstdint>
 #include <ctime>
 #include <random>
+#include <utility>
 #include <vector>
 
 #include "bench_fields.hpp"
@@ -56,8 +57,8 @@ struct Case {
     bool index = false;
     Script setup;
     Script timed;
-    bool fail_growth = false;  // the last growth of the side structure during the set-up fails
-    int rounds = 0;            // set-up and sample played this many times; 0: by size
+    long fail_after = -1;  // >= 0: in the last set-up step, the allocation after this many fails
+    int rounds = 0;        // set-up and sample played this many times; 0: by size
 };
 
 // Distinct random values in a fixed order: enough for every family.
@@ -173,17 +174,17 @@ void fail_allocation_after(long n) {
     memory::fail_allocation_after(n);
 }
 
-// The last set-up Add that allocates more than its node: a growth of the
-// side structure (the node comes first). Its index in the steps, or -1.
-std::ptrdiff_t last_growth(const Case& k) {
-    Fields<std::int32_t> f(k.index, true);
+// The last Add of a script that allocates more than its node (a growth of
+// the side structure) and how many blocks it allocates; -1 when none does.
+std::pair<std::ptrdiff_t, long> last_growth(const Script& adds) {
+    Fields<std::int32_t> f(false, true);
     IntegerCollection c = f.view();
-    std::ptrdiff_t found = -1;
-    for (std::size_t i = 0; i < k.setup.steps.size(); ++i) {
+    std::pair<std::ptrdiff_t, long> found{-1, 0};
+    for (std::size_t i = 0; i < adds.steps.size(); ++i) {
         const std::uint64_t before = allocations_so_far();
-        play(c, &k.setup.steps[i], &k.setup.steps[i] + 1);
-        if (k.setup.steps[i].op == Op::Add && allocations_so_far() - before >= 2) {
-            found = static_cast<std::ptrdiff_t>(i);
+        play(c, &adds.steps[i], &adds.steps[i] + 1);
+        if (const auto made = static_cast<long>(allocations_so_far() - before); made >= 2) {
+            found = {static_cast<std::ptrdiff_t>(i), made};
         }
     }
     return found;
@@ -194,11 +195,7 @@ void run(benchmark::State& state, const Case& family, std::int64_t fresh) {
     const Case k = fresh != 0 ? fresh_counterpart(family) : family;
     const auto n = static_cast<std::size_t>(state.range(0));
     const int rounds = k.rounds != 0 ? k.rounds : static_cast<int>(std::max<std::size_t>(100'000 / n, 1));
-    const std::ptrdiff_t failing = k.fail_growth ? last_growth(k) : -1;
-    if (k.fail_growth && failing < 0) {
-        state.SkipWithError("the set-up never grows the side structure");
-        return;
-    }
+    const std::ptrdiff_t failing = k.fail_after >= 0 ? static_cast<std::ptrdiff_t>(k.setup.steps.size()) - 1 : -1;
     std::int64_t seen = 0;
     for (auto _ : state) {
         for (int r = 0; r < rounds; ++r) {
@@ -208,7 +205,7 @@ void run(benchmark::State& state, const Case& family, std::int64_t fresh) {
             const Step* steps = k.setup.steps.data();
             if (failing >= 0) {
                 play(c, steps, steps + failing);
-                fail_allocation_after(1);
+                fail_allocation_after(k.fail_after);
                 play(c, steps + failing, steps + failing + 1);
                 fail_allocation_after(-1);
                 if (f->links.built()) {
@@ -431,20 +428,31 @@ void BM_Adv_PeakClears(benchmark::State& state) {
 BENCHMARK(BM_Adv_PeakClears)->ArgNames({"n", "fresh"})->Apply([](auto* b) { sizes(b, {}); });
 
 // ---- A flat window after the side structure failed to grow ----------------------
-// Ascending values (a chain); fail 1: the last growth of the side structure
-// while the window fills cannot get memory. At most 10,000 steps are timed.
+// Ascending values (a chain) fill the window up to the last Add before n that
+// grows the side structure; with fail 1 that growth cannot get memory. Then
+// the window slides; at most 10,000 steps are timed.
 
 void BM_Adv_FailWindow(benchmark::State& state) {
     const auto n = static_cast<std::size_t>(state.range(0));
     const std::size_t s = std::min<std::size_t>(sample(n), 10'000);
     const std::vector<std::int32_t> values = sorted(first(n + s));
+    Script fill;
+    for (std::size_t i = 0; i < n; ++i) {
+        fill.add(values[i]);
+    }
+    const auto [growth, blocks] = last_growth(fill);
+    if (growth < 0) {
+        state.SkipWithError("the side structure never grows");
+        return;
+    }
+    const auto w = static_cast<std::size_t>(growth) + 1;
     Case k;
-    k.fail_growth = state.range(1) != 0;
-    for (std::size_t i = 0; i < n + s; ++i) {
-        Script& into = i < n ? k.setup : k.timed;
+    k.fail_after = state.range(1) != 0 ? blocks - 1 : -1;
+    for (std::size_t i = 0; i < w + s; ++i) {
+        Script& into = i < w ? k.setup : k.timed;
         into.add(values[i]);
-        if (i >= n) {
-            into.remove(values[i - n]);
+        if (i >= w) {
+            into.remove(values[i - w]);
         }
     }
     run(state, k, state.range(2));
