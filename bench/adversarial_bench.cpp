@@ -226,6 +226,7 @@ void run(benchmark::State& state, const Case& family, std::int64_t fresh) {
     benchmark::DoNotOptimize(seen);
     const auto ops = static_cast<double>(k.timed.steps.size()) * rounds;
     state.counters["per_op"] = benchmark::Counter(ops, benchmark::Counter::kIsRate | benchmark::Counter::kInvert);
+    state.SetItemsProcessed(static_cast<std::int64_t>(ops));  // for scripts/charts.sh
     state.counters["held"] = static_cast<double>(k.setup.count);
 }
 

@@ -31,10 +31,9 @@ def load(paths):
                         medians[name] = b
                 else:
                     runs[name].append(b)
-    out = {}
+    out = dict(medians)
     for name, entries in runs.items():
         if name in medians:
-            out[name] = medians[name]
             continue
         merged = dict(entries[0])
         for key in entries[0]:
@@ -48,6 +47,7 @@ def split(name):
     parts = name.split("/")
     args = dict(p.split(":", 1) for p in parts[1:] if ":" in p)
     args.pop("iterations", None)
+    args.pop("repeats", None)
     return parts[0], args
 
 
