@@ -6,7 +6,7 @@ Usage: scripts/bench-pairs.py bench.json [more.json ...]
 Reads Google Benchmark JSON output of the BM_Adv_ families (medians when the
 run has repetitions, otherwise the median of the runs of each name) and
 prints Markdown tables: time per operation of each family and of its fresh
-random tree of the same size, their ratio, and how the family's time grows
+random tree of the same size, their ratio (bold above 2), and how the family's time grows
 from the smallest size to the largest against the counterpart's; then the
 IndexOf / Contains pairs and the memory rows.
 """
@@ -56,6 +56,10 @@ def ns(seconds):
     return f"{v:.0f} ns" if v >= 100 else f"{v:.1f} ns"
 
 
+def short(size):
+    return f"10^{len(str(size)) - 1}" if str(size).strip("0") == "1" else f"{size:,}"
+
+
 def main(paths):
     results = load(paths)
     families = defaultdict(dict)  # (family, variant) -> size -> (adv, fresh)
@@ -79,24 +83,24 @@ def main(paths):
         slot = families[(family[len("BM_Adv_"):], variant)].setdefault(size, [None, None])
         slot[1 if fresh else 0] = b["per_op"]
 
-    print("| family | variant | size | per op | fresh random | ratio |")
-    print("|---|---|---|---|---|---|")
-    growth = []
+    # One row per family and variant: its sizes, then per size the family's
+    # time per operation, the fresh tree's and their ratio; last, how both
+    # grow from the smallest size to the largest.
+    print("| family | variant | sizes | per op, fresh, ratio at each size | growth: family / fresh |")
+    print("|---|---|---|---|---|")
     for (family, variant), by_size in sorted(families.items()):
+        cells = []
         for size, (adv, fresh) in sorted(by_size.items()):
-            ratio = f"{adv / fresh:.2f}" if adv and fresh else "—"
-            print(f"| {family} | {variant} | {size:,} | {ns(adv) if adv else '—'} | "
-                  f"{ns(fresh) if fresh else '—'} | {ratio} |")
+            ratio = f"**{adv / fresh:.2f}**" if adv and fresh and adv / fresh > 2 else (
+                f"{adv / fresh:.2f}" if adv and fresh else "—")
+            cells.append(f"{ns(adv) if adv else '—'} / {ns(fresh) if fresh else '—'} / {ratio}")
         sizes = sorted(s for s, (a, f) in by_size.items() if a and f)
+        growth = "—"
         if len(sizes) >= 2:
             lo, hi = sizes[0], sizes[-1]
-            growth.append((family, variant, lo, hi, by_size[hi][0] / by_size[lo][0], by_size[hi][1] / by_size[lo][1]))
-
-    print()
-    print("| family | variant | sizes | family's growth | fresh tree's growth |")
-    print("|---|---|---|---|---|")
-    for family, variant, lo, hi, g_adv, g_fresh in growth:
-        print(f"| {family} | {variant} | {lo:,} → {hi:,} | {g_adv:.2f}× | {g_fresh:.2f}× |")
+            growth = f"{by_size[hi][0] / by_size[lo][0]:.1f}× / {by_size[hi][1] / by_size[lo][1]:.1f}×"
+        names = ", ".join(short(x) for x in sorted(by_size))
+        print(f"| {family} | {variant} | {names} | {' · '.join(cells)} | {growth} |")
 
     if pairs:
         print()
