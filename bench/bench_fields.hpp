@@ -4,7 +4,12 @@
 #include <benchmark/benchmark.h>
 
 #include <cstdint>
+#include <random>
 #include <vector>
+
+#if defined(__GLIBC__)
+#include <malloc.h>
+#endif
 
 #include "collections/collections.hpp"
 
@@ -32,6 +37,27 @@ struct Fields {
     }
     Collection<V> view() { return Collection<V>{root, count, index, with_links ? &links : nullptr}; }
 };
+
+// Random 32-bit values (repeats possible), the same for the same seed.
+inline std::vector<std::int32_t> random_ints(std::size_t n, std::uint32_t seed = 11) {
+    std::mt19937 random(seed);
+    std::vector<std::int32_t> v(n);
+    for (auto& x : v) {
+        x = static_cast<std::int32_t>(random());
+    }
+    return v;
+}
+
+// Heap bytes in use, from the C library's allocator statistics, so that its
+// per-block overhead counts for every contender alike.
+inline std::size_t heap_in_use() {
+#if defined(__GLIBC__)
+    const struct mallinfo2 info = mallinfo2();
+    return info.uordblks + info.hblkhd;  // large blocks are mapped apart from the heap
+#else
+    return 0;
+#endif
+}
 
 // Times Contains of every probe, and counts per probe.
 inline void time_contains(benchmark::State& state, IntegerCollection c, const std::vector<std::int32_t>& probes) {

@@ -13,10 +13,6 @@
 #include <utility>
 #include <vector>
 
-#if defined(__GLIBC__)
-#include <malloc.h>
-#endif
-
 #include "bench_fields.hpp"
 #include "collections/collections.hpp"
 
@@ -488,15 +484,6 @@ BENCHMARK(BM_Remove_Integers_Literal)
 // statistics, so that its own per-block overhead counts for every contender
 // alike. std::set's requested bytes are counted by its allocator as well.
 
-std::size_t heap_in_use() {
-#if defined(__GLIBC__)
-    const struct mallinfo2 info = mallinfo2();
-    return info.uordblks + info.hblkhd;  // large blocks are mapped apart from the heap
-#else
-    return 0;
-#endif
-}
-
 std::size_t g_requested = 0;
 
 template <class T>
@@ -533,23 +520,23 @@ void report_memory(benchmark::State& state, std::size_t heap, std::size_t reques
 void BM_Memory_Integers_Sorvel(benchmark::State& state) {
     const bool with_index = state.range(0) != 0;
     for (auto _ : state) {
-        const std::size_t heap = heap_in_use();
+        const std::size_t heap = bench::heap_in_use();
         Fields<std::int32_t> f(with_index);
         fill(f, random_integers());
-        report_memory(state, heap_in_use() - heap, 0, static_cast<std::size_t>(f.count));
+        report_memory(state, bench::heap_in_use() - heap, 0, static_cast<std::size_t>(f.count));
     }
 }
 BENCHMARK(BM_Memory_Integers_Sorvel)->ArgName("index")->Arg(0)->Arg(1)->Iterations(1)->Unit(benchmark::kMillisecond);
 
 void BM_Memory_Integers_StdSet(benchmark::State& state) {
     for (auto _ : state) {
-        const std::size_t heap = heap_in_use();
+        const std::size_t heap = bench::heap_in_use();
         const std::size_t requested = g_requested;
         std::set<std::int32_t, std::less<>, CountingAllocator<std::int32_t>> set;
         for (const std::int32_t v : random_integers()) {
             set.insert(v);
         }
-        report_memory(state, heap_in_use() - heap, g_requested - requested, set.size());
+        report_memory(state, bench::heap_in_use() - heap, g_requested - requested, set.size());
     }
 }
 BENCHMARK(BM_Memory_Integers_StdSet)->Iterations(1)->Unit(benchmark::kMillisecond);
@@ -557,23 +544,23 @@ BENCHMARK(BM_Memory_Integers_StdSet)->Iterations(1)->Unit(benchmark::kMillisecon
 void BM_Memory_Strings_Sorvel(benchmark::State& state) {
     const bool with_index = state.range(0) != 0;
     for (auto _ : state) {
-        const std::size_t heap = heap_in_use();
+        const std::size_t heap = bench::heap_in_use();
         Fields<char*> f(with_index);
         fill(f, random_strings(), true);
-        report_memory(state, heap_in_use() - heap, 0, static_cast<std::size_t>(f.count));
+        report_memory(state, bench::heap_in_use() - heap, 0, static_cast<std::size_t>(f.count));
     }
 }
 BENCHMARK(BM_Memory_Strings_Sorvel)->ArgName("index")->Arg(0)->Arg(1)->Iterations(1)->Unit(benchmark::kMillisecond);
 
 void BM_Memory_Strings_StdSet(benchmark::State& state) {
     for (auto _ : state) {
-        const std::size_t heap = heap_in_use();
+        const std::size_t heap = bench::heap_in_use();
         const std::size_t requested = g_requested;
         std::set<CountedString, std::less<>, CountingAllocator<CountedString>> set;
         for (const std::string& s : random_strings()) {
             set.emplace(s.data(), s.size());
         }
-        report_memory(state, heap_in_use() - heap, g_requested - requested, set.size());
+        report_memory(state, bench::heap_in_use() - heap, g_requested - requested, set.size());
     }
 }
 BENCHMARK(BM_Memory_Strings_StdSet)->Iterations(1)->Unit(benchmark::kMillisecond);

@@ -17,6 +17,7 @@
 #include <unordered_set>
 #include <vector>
 
+#include "bench_fields.hpp"
 #include "collections/collections.hpp"
 #include "collections/random_path.hpp"
 #include "loading/load_lines.hpp"
@@ -78,16 +79,8 @@ struct ScriptedDraws {
     sorvel::DrawSource source() { return sorvel::DrawSource{&ScriptedDraws::next, this}; }
 };
 
-struct Strings {
-    sorvel::StringNode* root = nullptr;
-    std::int32_t count = 0;
-    sorvel::StringCollection view() { return sorvel::StringCollection{root, count, nullptr}; }
-    void free() {
-        sorvel::FreeStringTree(root);
-        root = nullptr;
-        count = 0;
-    }
-};
+// Without an index, with the side structure, as a collection of the product.
+using Strings = sorvel::bench::Fields<char*>;
 
 std::size_t count_lines(const std::string& file) {
     std::size_t lines = 0;
@@ -100,7 +93,7 @@ std::size_t count_lines(const std::string& file) {
 template <class Load>
 void run(benchmark::State& state, const std::string& file, Load&& load) {
     std::vector<char> work(file.size() + 1);
-    Strings strings;
+    Strings strings(false, true);
     for (auto _ : state) {
         state.PauseTiming();
         std::memcpy(work.data(), file.data(), file.size());
@@ -109,7 +102,7 @@ void run(benchmark::State& state, const std::string& file, Load&& load) {
         load(strings, work.data(), file.size(), draws);
         state.PauseTiming();
         benchmark::DoNotOptimize(strings.count);
-        strings.free();
+        sorvel::clear(strings.view());
         state.ResumeTiming();
     }
     const std::size_t lines = count_lines(file);
@@ -147,7 +140,8 @@ void load_with_list(Strings& strings, char* data, std::size_t length, ScriptedDr
 
 void BM_LoadPlain(benchmark::State& state) {
     const std::string& file = random_file(static_cast<std::size_t>(state.range(0)));
-    run(state, file, [](Strings& s, char* d, std::size_t n, ScriptedDraws& r) { load_with_library(s, d, n, r, false); });
+    run(state, file,
+        [](Strings& s, char* d, std::size_t n, ScriptedDraws& r) { load_with_library(s, d, n, r, false); });
 }
 
 void BM_LoadBalanced(benchmark::State& state) {
@@ -162,7 +156,8 @@ void BM_LoadBalancedListReference(benchmark::State& state) {
 
 void BM_LoadPlainSortedChain(benchmark::State& state) {
     const std::string& file = sorted_file(static_cast<std::size_t>(state.range(0)));
-    run(state, file, [](Strings& s, char* d, std::size_t n, ScriptedDraws& r) { load_with_library(s, d, n, r, false); });
+    run(state, file,
+        [](Strings& s, char* d, std::size_t n, ScriptedDraws& r) { load_with_library(s, d, n, r, false); });
 }
 
 void BM_LoadBalancedSorted(benchmark::State& state) {

@@ -18,6 +18,7 @@ namespace {
 
 using namespace sorvel;
 using bench::Fields;
+using bench::random_ints;
 
 struct Lcg {
     std::uint32_t state = 12345;
@@ -29,15 +30,6 @@ struct Lcg {
     DrawSource source() { return {next, this}; }
 };
 
-std::vector<std::int32_t> random_values(std::size_t n, std::uint32_t seed) {
-    std::mt19937 random(seed);
-    std::vector<std::int32_t> v(n);
-    for (auto& x : v) {
-        x = static_cast<std::int32_t>(random());
-    }
-    return v;
-}
-
 // One random tree per size, with its index, kept for the read-only queries.
 Fields<std::int32_t>& random_tree(std::size_t n) {
     static std::map<std::size_t, std::unique_ptr<Fields<std::int32_t>>> trees;
@@ -45,7 +37,7 @@ Fields<std::int32_t>& random_tree(std::size_t n) {
     if (!f) {
         f = std::make_unique<Fields<std::int32_t>>(true);
         IntegerCollection c = f->view();
-        for (const std::int32_t v : random_values(n, 7)) {
+        for (const std::int32_t v : random_ints(n, 7)) {
             add(c, v);
         }
     }
@@ -59,7 +51,7 @@ void sizes(benchmark::internal::Benchmark* b) {
 }
 
 void BM_Scale_Add(benchmark::State& state) {
-    const auto values = random_values(static_cast<std::size_t>(state.range(0)), 7);
+    const auto values = random_ints(static_cast<std::size_t>(state.range(0)), 7);
     for (auto _ : state) {
         Fields<std::int32_t> f(false);
         IntegerCollection c = f.view();
@@ -76,7 +68,7 @@ BENCHMARK(BM_Scale_Add)->Apply(sizes)->Unit(benchmark::kMicrosecond);
 
 void BM_Scale_Contains(benchmark::State& state) {
     Fields<std::int32_t>& f = random_tree(static_cast<std::size_t>(state.range(0)));
-    const auto probes = random_values(static_cast<std::size_t>(state.range(0)), 7);  // every held value
+    const auto probes = random_ints(static_cast<std::size_t>(state.range(0)), 7);  // every held value
     std::size_t i = 0;
     for (auto _ : state) {
         benchmark::DoNotOptimize(contains(f.view(), probes[i++ % probes.size()]));
@@ -86,7 +78,7 @@ BENCHMARK(BM_Scale_Contains)->Apply(sizes);
 
 void BM_Scale_IndexOf(benchmark::State& state) {
     Fields<std::int32_t>& f = random_tree(static_cast<std::size_t>(state.range(0)));
-    const auto probes = random_values(static_cast<std::size_t>(state.range(0)), 7);
+    const auto probes = random_ints(static_cast<std::size_t>(state.range(0)), 7);
     std::size_t i = 0;
     for (auto _ : state) {
         benchmark::DoNotOptimize(position_of(f.view(), probes[i++ % probes.size()]));
@@ -107,7 +99,7 @@ BENCHMARK(BM_Scale_RandomElement)->Apply(sizes);
 void BM_Scale_Remove(benchmark::State& state) {
     const auto n = static_cast<std::size_t>(state.range(0));
     const bool with_index = state.range(1) != 0;
-    const auto values = random_values(n, 7);
+    const auto values = random_ints(n, 7);
     const std::size_t removals = std::min<std::size_t>(n / 10, 10'000);
     for (auto _ : state) {
         state.PauseTiming();

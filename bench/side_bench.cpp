@@ -11,10 +11,6 @@
 #include <string>
 #include <vector>
 
-#if defined(__GLIBC__)
-#include <malloc.h>
-#endif
-
 #include "bench_fields.hpp"
 #include "collections/collections.hpp"
 
@@ -22,15 +18,7 @@ namespace {
 
 using namespace sorvel;
 using bench::Fields;
-
-std::vector<std::int32_t> random_ints(std::size_t n, std::uint32_t seed = 11) {
-    std::mt19937 random(seed);
-    std::vector<std::int32_t> v(n);
-    for (auto& x : v) {
-        x = static_cast<std::int32_t>(random());
-    }
-    return v;
-}
+using bench::random_ints;
 
 // Letters of both cases, digits and "_[]": case folding matters for them.
 std::vector<std::string> random_strings(std::size_t n) {
@@ -313,13 +301,13 @@ void BM_Deep_Memory(benchmark::State& state) {
     }
     for (auto _ : state) {
 #if defined(__GLIBC__)
-        const std::size_t before = mallinfo2().uordblks + mallinfo2().hblkhd;
+        const std::size_t before = bench::heap_in_use();
         Fields<std::int32_t> f(state.range(1) != 0, state.range(2) != 0);
         IntegerCollection c = f.view();
         for (const std::int32_t v : values) {
             add(c, v);
         }
-        const std::size_t after = mallinfo2().uordblks + mallinfo2().hblkhd;
+        const std::size_t after = bench::heap_in_use();
         state.counters["heap_bytes_per_value"] = static_cast<double>(after - before) / static_cast<double>(f.count);
 #endif
     }
