@@ -5,10 +5,9 @@
 //
 // Memory follows the count. A full block whose empty slots are more than a
 // quarter of those handed out is packed in place instead of grown. A removal
-// that leaves a third of the capacity or less held moves the entries to a
-// block half as large again as their number, if one can be had, and one that
-// leaves more empty slots than held ones packs them. Clear gives the block
-// back.
+// that leaves half the capacity or less held moves the entries to a block
+// half as large again as their number, if one can be had (or else, with more
+// empty slots than held ones, packs them). Clear gives the block back.
 #pragma once
 
 #include <cstdint>
@@ -105,7 +104,7 @@ public:
         }
         // Shrinking is best-effort: without a smaller block the entries are
         // packed where they are.
-        if (size_ <= capacity_ / 3 && capacity_ > kSmallest && move_to(roomy(size_))) {
+        if (size_ <= capacity_ / 2 && capacity_ > kSmallest && move_to(roomy(size_))) {
             return;
         }
         if (used_ - size_ > size_) {

@@ -85,7 +85,7 @@ public:
     bool build(Node*& root, std::int32_t count) noexcept {
         drop();
         const auto n = static_cast<std::uint32_t>(count);
-        const std::uint32_t capacity = n + n / 8 + 16;
+        const std::uint32_t capacity = fitting(n);
         if (capacity < n || capacity > 0xFFFFFFFFU / sizeof(Entry) ||
             (pool_ = static_cast<Entry*>(memory::allocate(sizeof(Entry) * capacity))) == nullptr) {
             return false;
@@ -97,14 +97,15 @@ public:
         return true;
     }
 
-    // Once half the entries or fewer are in use, those in use move to a
-    // block that fits them, in two passes over the pool; kept as they are
-    // when memory runs out.
+    // Once a fifth of the entries are free, those in use move to a block that
+    // fits them, in two passes over the pool; kept as they are when memory
+    // runs out. Growth by a tenth leaves a margin above this, so a few Adds
+    // and Removes around one size never resize back and forth.
     void fit() noexcept {
-        if (size_ > capacity_ / 2 || capacity_ <= 64) {
+        if (std::uint64_t{size_} * 5 > std::uint64_t{capacity_} * 4 || capacity_ <= 64) {
             return;
         }
-        const std::uint32_t capacity = size_ + size_ / 8 + 16;
+        const std::uint32_t capacity = fitting(size_);
         auto* pool = static_cast<Entry*>(memory::allocate(sizeof(Entry) * capacity));
         if (pool == nullptr) {
             return;
@@ -227,6 +228,9 @@ public:
     }
 
 private:
+    // Room for n entries and a sixteenth more.
+    static std::uint32_t fitting(std::uint32_t n) noexcept { return n + n / 16 + 4; }
+
     // xorshift32: cheap, and apart from the C runtime's generator, whose
     // draws belong to the random picks and balanced loads.
     std::uint32_t next_priority() noexcept {
@@ -286,7 +290,7 @@ private:
     }
 
     bool grow() noexcept {
-        const std::uint32_t bigger = capacity_ + capacity_ / 2 + 16;
+        const std::uint32_t bigger = capacity_ + capacity_ / 10 + 16;
         if (bigger < capacity_ || bigger > 0xFFFFFFFFU / sizeof(Entry)) {
             return false;
         }
