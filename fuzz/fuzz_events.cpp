@@ -342,12 +342,19 @@ public:
                                                                0x10000 - 1};
         const std::uint8_t b = in_.byte();
         switch (b % 4) {
-            case 0:
-            case 1: return static_cast<std::int32_t>(in_.byte() % (static_cast<unsigned>(count) + 3U)) - 1;
+            case 0: return static_cast<std::int32_t>(in_.byte() % (static_cast<unsigned>(count) + 3U)) - 1;
+            case 1: return near_ + in_.small() % 3;  // around the position read last
             case 2: return kEdges[in_.byte() % kEdges.size()];
             default: return integer();
         }
     }
+
+    // What a read by position gave: later positions gather around it, and
+    // later values (removals, re-adds) pick it up from the pools.
+    void read_at(std::int32_t position) { near_ = position; }
+    void met(std::int32_t v) { ints_.put(v); }
+    void met(float v) { floats_.put(std::bit_cast<std::uint32_t>(v)); }
+    void met(const std::string& v) { strings_.put(v); }
 
     // The second argument of an expression handler: any 32-bit value.
     std::int32_t param_word() {
@@ -474,6 +481,7 @@ private:
     Pool<std::int32_t> ints_;
     Pool<std::uint32_t> floats_;
     Pool<std::string> strings_;
+    std::int32_t near_ = 0;
 };
 
 // ------------------------------------------------------------ the file
@@ -510,6 +518,13 @@ void write_file(const std::string& bytes) {
 }
 
 // ------------------------------------------------------------ one instance
+
+// A value of one collection: the field of its kind counts.
+struct Operand {
+    std::int32_t integer = 0;
+    std::uint32_t bits = 0;
+    Text text;
+};
 
 struct Subject {
     Instance* host = nullptr;
@@ -867,8 +882,9 @@ private:
     }
 
     // `failing_allocation`: for an add, the library's allocation (counted
-    // from 0 within the event) that is made to fail, or -1.
-    void action(Subject& s, std::size_t number, long failing_allocation = -1) {
+    // from 0 within the event) that is made to fail, or -1. `given`: the
+    // value of an add or remove, instead of one taken from the input.
+    void action(Subject& s, std::size_t number, long failing_allocation = -1, const Operand* given = nullptr) {
         if (allocations_ == nullptr) {
             failing_allocation = -1;
         }
@@ -902,7 +918,7 @@ private:
             case 8: s.model->clear(touched); break;
             case 0:
             case 1: {
-                const std::int32_t v = values_.integer();
+                const std::int32_t v = given != nullptr ? given->integer : values_.integer();
                 adds ? s.model->add_integer(v) : s.model->remove_integer(v);
                 params = {Param::of(v)};
                 calls = {event_param(s, 0)};
@@ -911,7 +927,7 @@ private:
             }
             case 3:
             case 4: {
-                const std::uint32_t bits = values_.float_bits();
+                const std::uint32_t bits = given != nullptr ? given->bits : values_.float_bits();
                 adds ? s.model->add_float(std::bit_cast<float>(bits))
                      : s.model->remove_float(std::bit_cast<float>(bits));
                 params = {float_param(bits)};
@@ -921,7 +937,7 @@ private:
             }
             case 6:
             case 7: {
-                const Text t = values_.text();
+                const Text t = given != nullptr ? given->text : values_.text();
                 adds ? s.model->add_string(t) : s.model->remove_string(t);
                 params = {text_param(t)};
                 calls = {event_param(s, -1)};
@@ -1192,6 +1208,108 @@ private:
             default: break;
         }
         expression(s, number, integer_param, float_bits, text, word_value, script);
+        if (number == 7 || number == 9 || number == 11) {
+            remember_read(s, static_cast<int>(number - 7) / 2, *integer_param);
+        }
+    }
+
+    // The value a collection holds at a position, as the model has it.
+    static std::optional<Operand> held_at(const fuzzmodel::Instance& m, int c, std::int32_t p) {
+        if (p < 0 || p >= count_of(m, c)) {
+            return std::nullopt;
+        }
+        Operand v;
+        switch (c) {
+            case kIntegers: v.integer = m.integer_at(p); break;
+            case kFloats: v.bits = std::bit_cast<std::uint32_t>(m.float_at(p)); break;
+            default: v.text = m.string_at(p); break;
+        }
+        return v;
+    }
+
+    // After a read by position: what it gave joins the values later events pick.
+    std::optional<Operand> remember_read(const Subject& s, int c, std::int32_t p) {
+        std::optional<Operand> v = held_at(*s.model, c, p);
+        if (v) {
+            values_.read_at(p);
+            if (c == kIntegers) {
+                values_.met(v->integer);
+            } else if (c == kFloats) {
+                values_.met(std::bit_cast<float>(v->bits));
+            } else {
+                values_.met(*v->text);
+            }
+        }
+        return v;
+    }
+
+    std::optional<Operand> read(Subject& s, int c, std::int32_t p) {
+        expression(s, 7 + 2 * static_cast<std::size_t>(c), p, std::nullopt, std::nullopt, p, {});
+        return remember_read(s, c, p);
+    }
+
+    void index_of(Subject& s, int c, const Operand& v) {
+        expression(s, 6 + 2 * static_cast<std::size_t>(c), c == kIntegers ? std::optional(v.integer) : std::nullopt,
+                   c == kFloats ? std::optional(v.bits) : std::nullopt,
+                   c == kStrings ? std::optional<Text>(v.text) : std::nullopt, 0, {});
+    }
+
+    // A walk through the positions of one collection, interleaved with
+    // IndexOf and with removals and re-adds of the values it reads, and with
+    // reads around the positions they touched: the index keeps state from
+    // one query to the next that only such runs reach.
+    void walk(Subject& s) {
+        const std::uint8_t head = in_.byte();
+        const int c = head % 3;
+        const auto count = [&] { return count_of(*s.model, c); };
+        std::int32_t p = static_cast<std::int32_t>(in_.byte() % (static_cast<unsigned>(count()) + 2U)) - 1;
+        std::optional<Operand> last;     // read last
+        std::optional<Operand> removed;  // removed last
+        const std::size_t steps = 3 + (head >> 2) % 14;
+        for (std::size_t i = 0; i < steps; ++i) {
+            const std::uint8_t op = in_.byte();
+            const long failing = (op >> 3) % 4 == 3 ? (op >> 5) % 3 : -1;
+            switch (op % 8) {
+                case 0:
+                case 1:
+                case 2:  // onwards
+                    if (std::optional<Operand> v = read(s, c, p++)) {
+                        last = std::move(v);
+                    }
+                    break;
+                case 3:  // back, or around
+                    p += (op >> 3) % 5 - 2;
+                    if (std::optional<Operand> v = read(s, c, p)) {
+                        last = std::move(v);
+                    }
+                    break;
+                case 4:
+                    if (last || removed) {
+                        index_of(s, c, last && (op & 8) == 0 ? *last : removed ? *removed : *last);
+                    }
+                    break;
+                case 5:  // the value just read
+                    if (last) {
+                        action(s, 3 * static_cast<std::size_t>(c) + 1, -1, &*last);
+                        removed = std::move(last);
+                        last.reset();
+                        p -= (op >> 3) & 1;
+                    }
+                    break;
+                case 6:  // back in, at the end; or a duplicate
+                    if (removed || last) {
+                        action(s, 3 * static_cast<std::size_t>(c), failing, removed ? &*removed : &*last);
+                    }
+                    break;
+                default:  // the value at the position, unread
+                    if (std::optional<Operand> v = held_at(*s.model, c, p)) {
+                        action(s, 3 * static_cast<std::size_t>(c) + 1, -1, &*v);
+                        removed = std::move(v);
+                    }
+                    break;
+            }
+            p = std::clamp(p, std::int32_t{-1}, count());
+        }
     }
 
     // The positions of each index, one before and one past each end, and
@@ -1253,7 +1371,9 @@ private:
             begin(s, {.name = "DestroyRunObject, then a new instance in its place"});
             host_.destroy(*s.host);
             create(s, s.number);
-        } else if (kind == 25 || kind == 27) {
+        } else if (kind == 27) {
+            walk(s);
+        } else if (kind == 25) {
             for (Subject& each : subjects_) {
                 for (int c = 0; c < 3; ++c) {
                     compare_tree(each, c);
