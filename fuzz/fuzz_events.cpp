@@ -36,6 +36,7 @@
 
 #include "driver.hpp"
 #include "exports_table.hpp"
+#include "invariants.hpp"
 #include "model.hpp"
 #include "support.hpp"
 #include "test_host.hpp"
@@ -66,7 +67,9 @@ constexpr std::size_t kHistory = 40;
 constexpr std::size_t kSweepFull = 24;  // larger collections are sampled
 constexpr std::size_t kMaxSweeps = 2;   // per input, besides the final one
 constexpr std::size_t kMaxFailingLoadLines = 100;
-constexpr std::size_t kTreeEvery = 32;  // events between whole-tree comparisons
+constexpr std::size_t kTreeEvery = 32;      // events between whole-tree comparisons
+constexpr std::int32_t kInspectSmall = 64;  // collections checked after every change
+constexpr std::size_t kInspectEvery = 8;    // changes between checks of larger ones
 
 constexpr std::uint16_t kFloatFlag = 0x4000;
 constexpr std::uint16_t kStringFlag = 0x8000;
@@ -566,7 +569,11 @@ const char* routine_name(Routine r) {
 class Session {
 public:
     explicit Session(Input& in)
-        : in_(in), values_(in), host_(fuzzdriver::library()), allocations_(host_.library().allocations()) {
+        : in_(in),
+          values_(in),
+          host_(fuzzdriver::library()),
+          allocations_(host_.library().allocations()),
+          inspect_(fuzzdriver::inspectable()) {
         live_at_start_ = allocations_ != nullptr ? allocations_->live() : 0;
     }
 
@@ -585,6 +592,7 @@ public:
         for (Subject& s : subjects_) {
             for (int c = 0; c < 3; ++c) {
                 compare_tree(s, c);
+                check_invariants(s, c);
             }
             sweep(s);
         }
@@ -771,6 +779,23 @@ private:
         // at once, and a walk per event would cost more than the event.
         if (touched >= 0 && event_number_ % kTreeEvery == 0) {
             compare_tree(s, touched);
+        }
+        // The side structure and the index after every change of a small
+        // collection, and every few changes of a larger one: a broken
+        // invariant shows within a few events, at a bounded cost per event.
+        if (touched >= 0 && (count_of(*s.model, touched) <= kInspectSmall || ++changes_ % kInspectEvery == 0)) {
+            check_invariants(s, touched);
+        }
+    }
+
+    void check_invariants(Subject& s, int collection) {
+        if (!inspect_) {
+            return;
+        }
+        const std::string fault =
+            sorvel::test::check_collection(*reinterpret_cast<const sorvel::RunRecord*>(s.host->record()), collection);
+        if (!fault.empty()) {
+            mismatch("invariant broken: " + fault);
         }
     }
 
@@ -1415,13 +1440,26 @@ private:
     std::vector<ExpectedCall> calls_;
     std::size_t live_at_start_ = 0;
     std::size_t sweeps_ = 0;
+    bool inspect_;             // the side structures can be checked
+    std::size_t changes_ = 0;  // of collections past kInspectSmall
 };
 
 }  // namespace
 
+namespace {
+const std::shared_ptr<Library>& linked_in() {
+    static const std::shared_ptr<Library> library = Library::linked_in();
+    return library;
+}
+}  // namespace
+
 std::shared_ptr<Library>& fuzzdriver::library() {
-    static std::shared_ptr<Library> chosen = Library::linked_in();
+    static std::shared_ptr<Library> chosen = linked_in();
     return chosen;
+}
+
+bool fuzzdriver::inspectable() {
+    return library() == linked_in();
 }
 
 extern "C" int LLVMFuzzerTestOneInput(const std::uint8_t* data, std::size_t size) {
