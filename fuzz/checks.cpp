@@ -82,7 +82,7 @@ void Session::call_exports() {
         } else if (std::string_view(e.name) == "GetRunObjectDataSize") {
             want = static_cast<word>(RecordLayout::kRunRecordSize);
         } else if (std::string_view(e.name) == "HandleRunObject") {
-            want = 2;
+            want = sorvel::answers::kHandleRunObject;
         } else if (!e.stub) {
             continue;  // the rest take the host's records: the session calls them
         }
