@@ -1,3 +1,7 @@
+// What every event is checked against: the exports' fixed answers, the
+// record after creation and its header bytes, the host calls the library
+// made, result flags, draws and counts after every handler call, the trees
+// against the model's, and the invariants of the side structures.
 #include <array>
 #include <cstring>
 #include <string_view>
