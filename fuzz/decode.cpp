@@ -252,8 +252,8 @@ bool Decoder::walk_step(const fuzzmodel::Instance& m, Event& out) {
             out.failing = (op >> 3) % 4 == 3 ? (op >> 5) % 3 : -1;
             with_value(out, walk_.removed ? *walk_.removed : *walk_.last);
             return true;
-        default:  // the value at the position, unread
-            if (std::optional<Held> v = held_at(m, c, p)) {
+        default:  // unread: the value at the position, or one the walk has passed
+            if (std::optional<Held> v = held_at(m, c, p - (op >> 3) % 4)) {
                 out.kind = Event::Kind::action;
                 out.number = 3 * c_number + 1;
                 with_value(out, *v);

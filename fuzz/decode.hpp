@@ -13,11 +13,11 @@
 // trees grow; 31 an add or a load during which one allocation fails.
 //
 // A walk reads one collection position by position, and between the reads
-// asks IndexOf of the values read, removes them or the value at the position,
-// adds them back (at the end of the insertion order), and steps back or
-// around: the index keeps state from one query to the next that only such
-// runs reach. Its steps are events of their own, decoded one at a time, as
-// each depends on what the ones before it did.
+// asks IndexOf of the values read, removes them or a value at or just behind
+// the position, adds them back (at the end of the insertion order), and
+// steps back or around: the index keeps state from one query to the next
+// that only such runs reach. Its steps are events of their own, decoded one
+// at a time, as each depends on what the ones before it did.
 #pragma once
 
 #include <cstddef>
