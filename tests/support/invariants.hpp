@@ -2,17 +2,15 @@
 // the product's inspection interface only: the side structure (a treap of the
 // links that point at the tree's nodes) and the insertion index (slots, their
 // bits and the counts over the bits). Each gives a description of the first
-// broken invariant, or an empty string. They cost O(n log n) in the size of
-// the collection, so callers choose how often to run them.
+// broken invariant, or an empty string. One check costs O(n) in the values
+// and the index's capacity, so callers choose how often to run it.
 #pragma once
 
-#include <algorithm>
 #include <bit>
 #include <cstddef>
 #include <cstdint>
 #include <cstring>
 #include <string>
-#include <utility>
 #include <vector>
 
 #include "collections/collections.hpp"
@@ -20,96 +18,11 @@
 
 namespace sorvel::test {
 
-// The tree's nodes with the links that point at them, in no order; empty when
-// the walk meets more nodes than `count` (a cycle, or a count too low).
+// The index on its own: a bit per slot, set exactly for the handed-out slots
+// that hold a node, each node numbered with its slot, counts that agree with
+// the bits, and as many held as the collection has values.
 template <class Node>
-std::vector<Node* const*> tree_links(Node* const* root, std::int32_t count) {
-    std::vector<Node* const*> links;
-    std::vector<Node* const*> pending{root};
-    while (!pending.empty()) {
-        Node* const* at = pending.back();
-        pending.pop_back();
-        if (*at == nullptr) {
-            continue;
-        }
-        if (links.size() == static_cast<std::size_t>(count)) {
-            return {};
-        }
-        links.push_back(at);
-        pending.push_back(&(*at)->left);
-        pending.push_back(&(*at)->right);
-    }
-    return links;
-}
-
-// The side structure, when built: a treap whose in-order keys rise strictly
-// under `order`, whose priorities never rise downwards, and whose entries are
-// exactly the links of the tree, each with the value of the node it points at.
-template <class Node, class Order>
-std::string check_links(const LinkIndex<Node>& links, Node* const* root, std::int32_t count, const Order& order) {
-    if (!links.built()) {
-        return {};
-    }
-    using Index = LinkIndex<Node>;
-    if (links.size() != static_cast<std::uint32_t>(count)) {
-        return "side structure holds " + std::to_string(links.size()) + " entries for " + std::to_string(count) +
-               " values";
-    }
-    std::vector<Node* const*> held;
-    std::vector<std::uint32_t> seen;
-    // In order, without recursion: the entries whose left side is done wait.
-    std::vector<std::uint32_t> waiting;
-    const typename Index::Entry* previous = nullptr;
-    for (std::uint32_t e = links.root(); e != Index::kNone || !waiting.empty();) {
-        for (; e != Index::kNone; e = links.entry(e).left) {
-            if (e >= links.capacity()) {
-                return "side structure: a child " + std::to_string(e) + " past the pool's " +
-                       std::to_string(links.capacity()) + " entries";
-            }
-            if (seen.size() + waiting.size() > links.size()) {
-                return "side structure: more entries reachable than it holds (a cycle or a shared entry)";
-            }
-            waiting.push_back(e);
-        }
-        e = waiting.back();
-        waiting.pop_back();
-        seen.push_back(e);
-        const typename Index::Entry& x = links.entry(e);
-        for (const std::uint32_t child : {x.left, x.right}) {
-            if (child != Index::kNone && links.entry(child).priority > x.priority) {
-                return "side structure: entry " + std::to_string(child) + " has a higher priority than its parent " +
-                       std::to_string(e);
-            }
-        }
-        if (previous != nullptr && order(previous->key, x.key) >= 0) {
-            return "side structure: entry " + std::to_string(e) + " is out of order";
-        }
-        if (x.link == nullptr || *x.link == nullptr || std::memcmp(&(*x.link)->value, &x.key, sizeof x.key) != 0) {
-            return "side structure: entry " + std::to_string(e) + " does not point at the node of its key";
-        }
-        held.push_back(x.link);
-        previous = &x;
-        e = x.right;
-    }
-    std::sort(seen.begin(), seen.end());
-    if (seen.size() != links.size() || std::adjacent_find(seen.begin(), seen.end()) != seen.end()) {
-        return "side structure: " + std::to_string(seen.size()) + " entries reachable, some twice, of " +
-               std::to_string(links.size());
-    }
-    std::vector<Node* const*> tree = tree_links(root, count);
-    std::sort(tree.begin(), tree.end());
-    std::sort(held.begin(), held.end());
-    if (tree != held) {
-        return "side structure: its links are not the tree's links";
-    }
-    return {};
-}
-
-// The insertion index: a bit per slot, set exactly for the handed-out slots
-// that hold a node, each node numbered with its slot; counts that agree with
-// the bits; and every node of the tree held.
-template <class Node>
-std::string check_index(const InsertionIndex<Node>& index, Node* const* root, std::int32_t count) {
+std::string check_index(const InsertionIndex<Node>& index, std::int32_t count) {
     const RankedBits& bits = index.held();
     constexpr std::size_t kBits = RankedBits::kWordBits;
     if (index.used() > index.capacity() || bits.words() * kBits < index.capacity()) {
@@ -120,14 +33,9 @@ std::string check_index(const InsertionIndex<Node>& index, Node* const* root, st
     for (std::size_t s = 0; s < bits.words() * kBits; ++s) {
         const bool bit = ((bits.word(s / kBits) >> (s % kBits)) & 1U) != 0;
         const Node* node = s < index.used() ? index.slot(static_cast<std::uint32_t>(s)) : nullptr;
-        if (bit != (node != nullptr)) {
-            return "index: the bit of slot " + std::to_string(s) + " is " + (bit ? "set" : "clear") + " for " +
-                   (node != nullptr    ? "a held node"
-                    : s < index.used() ? "an emptied slot"
-                                       : "a slot not handed out");
-        }
-        if (node != nullptr && node->order != s) {
-            return "index: the node in slot " + std::to_string(s) + " is numbered " + std::to_string(node->order);
+        if (bit != (node != nullptr) || (node != nullptr && node->order != s)) {
+            return "index: slot " + std::to_string(s) + " has its bit " + (bit ? "set" : "clear") + " and " +
+                   (node != nullptr ? "a node numbered " + std::to_string(node->order) : "no node");
         }
         set += bit ? 1U : 0U;
     }
@@ -145,37 +53,108 @@ std::string check_index(const InsertionIndex<Node>& index, Node* const* root, st
         return "index: size " + std::to_string(index.size()) + ", " + std::to_string(set) + " bits set, " +
                std::to_string(count) + " values";
     }
-    for (Node* const* link : tree_links(root, count)) {
-        const Node* node = *link;
-        if (node->order >= index.used() || index.slot(node->order) != node) {
+    return {};
+}
+
+// One collection. The tree and the side structure are both walked in order,
+// side by side: the i-th entry must hold the i-th link of the tree (so that
+// every node is reached once) and that node's value as its key, the keys must
+// rise strictly under `order`, and no child may outrank its parent. With an
+// index, every node of the tree must sit in its slot.
+template <class Node, class Order>
+std::string check_collection(Node* const* root, std::int32_t count, const LinkIndex<Node>* links,
+                             const InsertionIndex<Node>* index, const Order& order) {
+    using Links = LinkIndex<Node>;
+    if (index != nullptr) {
+        if (std::string fault = check_index(*index, count); !fault.empty()) {
+            return fault;
+        }
+    }
+    const bool side = links != nullptr && links->built();
+    if (side && links->size() != static_cast<std::uint32_t>(count)) {
+        return "side structure: " + std::to_string(links->size()) + " entries for " + std::to_string(count) + " values";
+    }
+    std::vector<Node* const*> nodes;  // links whose left subtree is still to walk
+    std::vector<std::uint32_t> entries;
+    std::int32_t seen = 0;
+    const typename Links::Entry* previous = nullptr;
+    std::uint32_t e = side ? links->root() : Links::kNone;
+    for (Node* const* at = root; *at != nullptr || !nodes.empty();) {
+        for (; *at != nullptr; at = &(*at)->left) {
+            if (nodes.size() > static_cast<std::size_t>(count)) {
+                return "tree: a path longer than the count of " + std::to_string(count);
+            }
+            nodes.push_back(at);
+        }
+        at = nodes.back();
+        nodes.pop_back();
+        if (++seen > count) {
+            return "tree: more nodes than the count of " + std::to_string(count);
+        }
+        const Node* node = *at;
+        if (index != nullptr && (node->order >= index->used() || index->slot(node->order) != node)) {
             return "index: a node of the tree is not in its slot " + std::to_string(node->order);
         }
+        if (side) {
+            for (; e != Links::kNone; e = links->entry(e).left) {
+                if (e >= links->capacity() || entries.size() >= links->size()) {
+                    return "side structure: entry " + std::to_string(e) + " out of the pool or reached twice";
+                }
+                entries.push_back(e);
+            }
+            if (entries.empty()) {
+                return "side structure: fewer entries in order than nodes in the tree";
+            }
+            const std::uint32_t x = entries.back();
+            entries.pop_back();
+            const typename Links::Entry& entry = links->entry(x);
+            for (const std::uint32_t child : {entry.left, entry.right}) {
+                if (child != Links::kNone && child < links->capacity() &&
+                    links->entry(child).priority > entry.priority) {
+                    return "side structure: entry " + std::to_string(child) + " outranks its parent " +
+                           std::to_string(x);
+                }
+            }
+            if (entry.link != at || std::memcmp(&node->value, &entry.key, sizeof entry.key) != 0) {
+                return "side structure: entry " + std::to_string(x) + " is not the tree's link in its place";
+            }
+            if (previous != nullptr && order(previous->key, entry.key) >= 0) {
+                return "side structure: entry " + std::to_string(x) + " is out of order";
+            }
+            previous = &entry;
+            e = entry.right;
+        }
+        at = &node->right;
+    }
+    if (seen != count) {
+        return "tree: " + std::to_string(seen) + " nodes for a count of " + std::to_string(count);
+    }
+    if (side && (e != Links::kNone || !entries.empty())) {
+        return "side structure: more entries in order than nodes in the tree";
     }
     return {};
 }
 
-// Both, for one collection of an instance of the library linked in (the
-// layouts are this program's own): 0 integers, 1 floats, 2 strings.
+// One collection of an instance of the library linked in (the layouts are
+// this program's own): 0 integers, 1 floats, 2 strings.
 inline std::string check_collection(const RunRecord& r, int collection) {
     if (r.reader == nullptr) {
         return {};
     }
     const LinkIndexes& links = reinterpret_cast<const InstanceBlock*>(r.reader)->links;
-    const auto check = [](const char* name, const auto& side, auto* const* root, std::int32_t count, const auto* index,
-                          const auto& order) {
-        std::string fault = check_links(side, root, count, order);
-        if (fault.empty() && index != nullptr) {
-            fault = check_index(*index, root, count);
-        }
-        return fault.empty() ? fault : name + (": " + fault);
-    };
+    std::string fault;
     switch (collection) {
         case 0:
-            return check("integers", links.integers, &r.integer_root, r.integer_count, r.integer_index, IntegerOrder{});
-        case 1: return check("floats", links.floats, &r.float_root, r.float_count, r.float_index, FloatOrder{});
+            fault =
+                check_collection(&r.integer_root, r.integer_count, &links.integers, r.integer_index, IntegerOrder{});
+            return fault.empty() ? fault : "integers: " + fault;
+        case 1:
+            fault = check_collection(&r.float_root, r.float_count, &links.floats, r.float_index, FloatOrder{});
+            return fault.empty() ? fault : "floats: " + fault;
         default:
-            return check("strings", links.strings, &r.string_root, r.string_count, r.string_index,
-                         StringOrder{r.case_sensitive == 1});
+            fault = check_collection(&r.string_root, r.string_count, &links.strings, r.string_index,
+                                     StringOrder{r.case_sensitive == 1});
+            return fault.empty() ? fault : "strings: " + fault;
     }
 }
 
