@@ -39,9 +39,14 @@ std::string check_index(const InsertionIndex<Node>& index, std::int32_t count) {
         }
         set += bit ? 1U : 0U;
     }
-    for (std::size_t i = 1; i <= bits.words(); ++i) {
+    // Count i covers the groups of words (i - lowest_bit(i), i].
+    constexpr std::size_t kGroup = RankedBits::kGroupWords;
+    if (bits.groups() != (bits.words() + kGroup - 1) / kGroup) {
+        return "index: " + std::to_string(bits.groups()) + " counts for " + std::to_string(bits.words()) + " words";
+    }
+    for (std::size_t i = 1; i <= bits.groups(); ++i) {
         std::size_t recount = 0;
-        for (std::size_t w = i - RankedBits::lowest_bit(i); w < i; ++w) {
+        for (std::size_t w = (i - RankedBits::lowest_bit(i)) * kGroup; w < i * kGroup && w < bits.words(); ++w) {
             recount += static_cast<std::size_t>(std::popcount(bits.word(w)));
         }
         if (bits.count(i) != recount) {
