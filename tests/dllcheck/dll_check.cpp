@@ -196,8 +196,7 @@ struct Function {
 };
 
 std::map<std::string, Function> parse_disassembly(const std::string& text, const Image& image) {
-    static const std::regex instruction(
-        R"(^\s*([0-9a-f]+):\t[0-9a-f ]+\t(?:(?:repz|rep|bnd|notrack) )?(\S.*?)\s*$)"),
+    static const std::regex instruction(R"(^\s*([0-9a-f]+):\t[0-9a-f ]+\t(?:(?:repz|rep|bnd|notrack) )?(\S.*?)\s*$)"),
         target(R"(^(j\w+|call)\s+0x([0-9a-f]+)$)");
     std::map<std::string, Function> functions;
     std::istringstream in(text);
@@ -345,8 +344,8 @@ TEST_F(ProductDll, AllocationSeamKeepsNoCounter) {
         }
     }
     ASSERT_LT(data_low, data_high);
-    for (const auto& [symbol, thunk] : {std::pair{"__ZN6sorvel6memory8allocateEj", "_malloc"},
-                                        std::pair{"__ZN6sorvel6memory7releaseEPv", "_free"}}) {
+    for (const auto& [symbol, thunk] :
+         {std::pair{"__ZN6sorvel6memory8allocateEj", "_malloc"}, std::pair{"__ZN6sorvel6memory7releaseEPv", "_free"}}) {
         const auto found = functions_->find(symbol);
         ASSERT_NE(found, functions_->end()) << "no function " << symbol;
         for (const std::string& ins : found->second.instructions) {
@@ -355,8 +354,7 @@ TEST_F(ProductDll, AllocationSeamKeepsNoCounter) {
                 EXPECT_TRUE(std::regex_search(ins, m, callee) && m[1] == thunk) << symbol << ": " << ins;
                 continue;
             }
-            for (auto it = std::sregex_iterator(ins.begin(), ins.end(), address); it != std::sregex_iterator();
-                 ++it) {
+            for (auto it = std::sregex_iterator(ins.begin(), ins.end(), address); it != std::sregex_iterator(); ++it) {
                 const unsigned long at = std::stoul((*it)[1], nullptr, 16);
                 EXPECT_FALSE(at >= data_low && at < data_high) << symbol << " touches data: " << ins;
             }

@@ -38,11 +38,14 @@ std::string contents(Instance& instance) {
 }
 
 TEST(Allocation, EveryAllocationOfAnAddOrALoadMayFail) {
+#if defined(_WIN32)
+    ASSERT_NE(Library::built()->allocations(), nullptr) << "the DLL's allocator imports were not rerouted";
+#endif
     Host host(sorvel::test::counted_library());
     const auto* allocations = host.library().allocations();
     ASSERT_NE(allocations, nullptr);
-    const auto file = std::filesystem::temp_directory_path() /
-                      ("sorvel-sweep-" + std::to_string(std::random_device{}()) + ".txt");
+    const auto file =
+        std::filesystem::temp_directory_path() / ("sorvel-sweep-" + std::to_string(std::random_device{}()) + ".txt");
     std::ofstream(file, std::ios::binary) << "delta\nalpha\r\ncharlie\n\nbravo\nalpha\necho";
     const std::vector<std::pair<const char*, std::vector<Param>>> events = {
         {"Add Integer: %0", {Param::of(std::int32_t{7})}},
@@ -91,9 +94,15 @@ TEST(Allocation, EveryAllocationOfAnAddOrALoadMayFail) {
 }
 
 #if defined(__i386__)
-word __attribute__((stdcall)) takes_one(word a) { return a; }
-word __attribute__((stdcall)) takes_two(word a, word b) { return a + b; }
-word __attribute__((cdecl)) leaves_two(word a, word b) { return a - b; }
+word __attribute__((stdcall)) takes_one(word a) {
+    return a;
+}
+word __attribute__((stdcall)) takes_two(word a, word b) {
+    return a + b;
+}
+word __attribute__((cdecl)) leaves_two(word a, word b) {
+    return a - b;
+}
 
 // The check that every end-to-end call passes counts each callee that
 // removes other than its own argument bytes, and the calls still return.
@@ -102,15 +111,15 @@ TEST(StackCheck, CatchesACalleeThatRemovesTheWrongBytes) {
     const auto library = Library::linked_in();
     struct Case {
         void* callee;
-        bool one_word;            // else two
+        bool one_word;               // else two
         std::optional<word> result;  // none where the callee reads a word it was not given
         std::size_t errors;
     };
     const std::vector<Case> cases = {
         {reinterpret_cast<void*>(&takes_two), false, 8, 0},
-        {reinterpret_cast<void*>(&takes_one), false, 5, 1},             // removes 4 bytes of 8
+        {reinterpret_cast<void*>(&takes_one), false, 5, 1},            // removes 4 bytes of 8
         {reinterpret_cast<void*>(&takes_two), true, std::nullopt, 1},  // removes 8 bytes of 4
-        {reinterpret_cast<void*>(&leaves_two), false, 2, 1},            // removes none
+        {reinterpret_cast<void*>(&leaves_two), false, 2, 1},           // removes none
     };
     Library::reset_stack_errors();
     for (const Case& c : cases) {

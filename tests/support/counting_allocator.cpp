@@ -95,9 +95,15 @@ const Heap kProgramHeap{[](std::size_t bytes) { return std::malloc(bytes); },
 
 }  // namespace
 
-std::size_t live() { return counter().blocks.size(); }
-std::uint64_t total() { return counter().total; }
-void fail_after(long n) { counter().countdown = n < 0 ? -1 : n; }
+std::size_t live() {
+    return counter().blocks.size();
+}
+std::uint64_t total() {
+    return counter().total;
+}
+void fail_after(long n) {
+    counter().countdown = n < 0 ? -1 : n;
+}
 
 namespace {
 
@@ -106,10 +112,18 @@ namespace {
 // the same msvcrt, so one set of them serves every rerouted module.
 Heap g_module_heap{};
 
-void* counted_malloc(std::size_t bytes) { return allocate(g_module_heap, bytes); }
-void* counted_calloc(std::size_t count, std::size_t bytes) { return allocate_zeroed(g_module_heap, count, bytes); }
-void* counted_realloc(void* block, std::size_t bytes) { return reallocate(g_module_heap, block, bytes); }
-void counted_free(void* block) { release(g_module_heap, block); }
+void* counted_malloc(std::size_t bytes) {
+    return allocate(g_module_heap, bytes);
+}
+void* counted_calloc(std::size_t count, std::size_t bytes) {
+    return allocate_zeroed(g_module_heap, count, bytes);
+}
+void* counted_realloc(void* block, std::size_t bytes) {
+    return reallocate(g_module_heap, block, bytes);
+}
+void counted_free(void* block) {
+    release(g_module_heap, block);
+}
 
 template <class T>
 T* at(HMODULE module, DWORD rva) {
@@ -171,7 +185,9 @@ bool reroute(void* handle) {
     return rerouted != 0;
 }
 #else
-bool reroute(void*) { return false; }  // a shared object's allocations stay out of reach
+bool reroute(void*) {
+    return false;
+}  // a shared object's allocations stay out of reach
 #endif
 
 // Tells the test host about the counter as the program starts.

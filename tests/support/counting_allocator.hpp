@@ -11,8 +11,8 @@
 
 namespace sorvel::test::counting {
 
-std::size_t live();      // blocks allocated through the counter and not yet freed
-std::uint64_t total();   // allocations (and moves by realloc) made so far
+std::size_t live();       // blocks allocated through the counter and not yet freed
+std::uint64_t total();    // allocations (and moves by realloc) made so far
 void fail_after(long n);  // the n-th allocation from now fails (0: the next); negative: none
 
 }  // namespace sorvel::test::counting

@@ -108,13 +108,16 @@ std::pair<std::uintptr_t, std::size_t> preferred_range(const std::string& path) 
     return {static_cast<std::uintptr_t>(nt.OptionalHeader.ImageBase), nt.OptionalHeader.SizeOfImage};
 }
 
-std::string system_message(DWORD error) {
+std::string system_message(DWORD error, const std::string& path) {
     char text[256] = {};
-    const DWORD n = FormatMessageA(FORMAT_MESSAGE_FROM_SYSTEM | FORMAT_MESSAGE_IGNORE_INSERTS, nullptr, error, 0,
-                                   text, sizeof text, nullptr);
+    const DWORD n = FormatMessageA(FORMAT_MESSAGE_FROM_SYSTEM | FORMAT_MESSAGE_IGNORE_INSERTS, nullptr, error, 0, text,
+                                   sizeof text, nullptr);
     std::string message(text, n);
     while (!message.empty() && std::isspace(static_cast<unsigned char>(message.back())) != 0) {
         message.pop_back();
+    }
+    if (const auto insert = message.find("%1"); insert != std::string::npos) {
+        message.replace(insert, 2, path);
     }
     return "error " + std::to_string(error) + (message.empty() ? "" : " (" + message + ")");
 }
@@ -134,7 +137,7 @@ std::shared_ptr<Library> Library::load(const std::string& path, Placement placem
     }
     HMODULE module = LoadLibraryA(path.c_str());
     if (module == nullptr) {
-        throw std::runtime_error("cannot load " + path + ": " + system_message(GetLastError()));
+        throw std::runtime_error("cannot load " + path + ": " + system_message(GetLastError(), path));
     }
     library->handle_ = reinterpret_cast<void*>(module);
     library->loader_owned_ = true;
@@ -277,11 +280,11 @@ word Library::call(void* function, std::initializer_list<word> args) const {
         case 3: return reinterpret_cast<word(SORVEL_CALL*)(word, word, word)>(function)(a[0], a[1], a[2]);
         case 4: return reinterpret_cast<word(SORVEL_CALL*)(word, word, word, word)>(function)(a[0], a[1], a[2], a[3]);
         case 5:
-            return reinterpret_cast<word(SORVEL_CALL*)(word, word, word, word, word)>(function)(a[0], a[1], a[2],
-                                                                                                  a[3], a[4]);
+            return reinterpret_cast<word(SORVEL_CALL*)(word, word, word, word, word)>(function)(a[0], a[1], a[2], a[3],
+                                                                                                a[4]);
         case 6:
-            return reinterpret_cast<word(SORVEL_CALL*)(word, word, word, word, word, word)>(function)(
-                a[0], a[1], a[2], a[3], a[4], a[5]);
+            return reinterpret_cast<word(SORVEL_CALL*)(word, word, word, word, word, word)>(function)(a[0], a[1], a[2],
+                                                                                                      a[3], a[4], a[5]);
         default:
             return reinterpret_cast<word(SORVEL_CALL*)(word, word, word, word, word, word, word)>(function)(
                 a[0], a[1], a[2], a[3], a[4], a[5], a[6]);
