@@ -110,38 +110,6 @@ Headers parse_headers(const std::string& text) {
     return h;
 }
 
-// Every path out of `symbol` returns with `ret 4*args`: each ret of its body
-// carries that immediate, and a body without a ret ends in tail jumps to
-// other functions, checked the same way.
-void expect_callee_cleanup(const std::map<std::string, Function>& functions, const std::string& symbol, int args,
-                           std::set<std::string>& seen) {
-    static const std::regex ret(R"(^retl?\s*(\S*))"), jump(R"(^jmp\s+0x[0-9a-f]+ <([^>]+)>)");
-    const auto found = functions.find(symbol);
-    if (!seen.insert(symbol).second || found == functions.end()) {
-        EXPECT_NE(found, functions.end()) << "no function " << symbol;
-        return;
-    }
-    std::ostringstream immediate;  // "$0x8" for two words, nothing for none
-    if (args != 0) {
-        immediate << "$0x" << std::hex << 4 * args;
-    }
-    std::vector<std::string> tails;
-    std::size_t rets = 0;
-    std::smatch m;
-    for (const std::string& ins : found->second.instructions) {
-        if (std::regex_search(ins, m, ret)) {
-            ++rets;
-            EXPECT_EQ(m[1].str(), immediate.str()) << symbol << ": " << ins;
-        } else if (std::regex_search(ins, m, jump) && m[1] != symbol) {
-            tails.push_back(m[1]);
-        }
-    }
-    EXPECT_TRUE(rets != 0 || !tails.empty()) << symbol << " neither returns nor jumps to another function";
-    for (const std::string& tail : rets == 0 ? tails : std::vector<std::string>{}) {
-        expect_callee_cleanup(functions, tail, args, seen);
-    }
-}
-
 // A word of the image at an address, read from -s of the DLL; a symbol's
 // address from -t of its symbols and the sections' addresses from -h.
 struct Image {
@@ -223,6 +191,38 @@ std::map<std::string, Function> parse_disassembly(const std::string& text, const
         f.instructions.push_back(ins);
     }
     return functions;
+}
+
+// Every path out of `symbol` returns with `ret 4*args`: each ret of its body
+// carries that immediate, and a body without a ret ends in tail jumps to
+// other functions, checked the same way.
+void expect_callee_cleanup(const std::map<std::string, Function>& functions, const std::string& symbol, int args,
+                           std::set<std::string>& seen) {
+    static const std::regex ret(R"(^retl?\s*(\S*))"), jump(R"(^jmp\s+0x[0-9a-f]+ <([^>]+)>)");
+    const auto found = functions.find(symbol);
+    if (!seen.insert(symbol).second || found == functions.end()) {
+        EXPECT_NE(found, functions.end()) << "no function " << symbol;
+        return;
+    }
+    std::ostringstream immediate;  // "$0x8" for two words, nothing for none
+    if (args != 0) {
+        immediate << "$0x" << std::hex << 4 * args;
+    }
+    std::vector<std::string> tails;
+    std::size_t rets = 0;
+    std::smatch m;
+    for (const std::string& ins : found->second.instructions) {
+        if (std::regex_search(ins, m, ret)) {
+            ++rets;
+            EXPECT_EQ(m[1].str(), immediate.str()) << symbol << ": " << ins;
+        } else if (std::regex_search(ins, m, jump) && m[1] != symbol) {
+            tails.push_back(m[1]);
+        }
+    }
+    EXPECT_TRUE(rets != 0 || !tails.empty()) << symbol << " neither returns nor jumps to another function";
+    for (const std::string& tail : rets == 0 ? tails : std::vector<std::string>{}) {
+        expect_callee_cleanup(functions, tail, args, seen);
+    }
 }
 
 // Conditions and actions take three words, expressions two.

@@ -58,13 +58,33 @@ void* allocate(const Heap& heap, std::size_t bytes) {
     return counter().fails() ? nullptr : counter().counted(heap.malloc(bytes));
 }
 
-void* allocate_zeroed(const Heap& heap, std::size_t count, std::size_t bytes) {
-    return counter().fails() ? nullptr : counter().counted(heap.calloc(count, bytes));
-}
-
 void release(const Heap& heap, void* block) {
     counter().blocks.erase(block);
     heap.free(block);
+}
+
+const Heap kProgramHeap{[](std::size_t bytes) { return std::malloc(bytes); },
+                        [](std::size_t count, std::size_t bytes) { return std::calloc(count, bytes); },
+                        [](void* block, std::size_t bytes) { return std::realloc(block, bytes); },
+                        [](void* block) { std::free(block); }};
+
+}  // namespace
+
+std::size_t live() {
+    return counter().blocks.size();
+}
+std::uint64_t total() {
+    return counter().total;
+}
+void fail_after(long n) {
+    counter().countdown = n < 0 ? -1 : n;
+}
+
+namespace {
+
+#if defined(_WIN32)
+void* allocate_zeroed(const Heap& heap, std::size_t count, std::size_t bytes) {
+    return counter().fails() ? nullptr : counter().counted(heap.calloc(count, bytes));
 }
 
 // msvcrt's realloc: null allocates, size 0 frees. A block allocated before
@@ -88,26 +108,6 @@ void* reallocate(const Heap& heap, void* block, std::size_t bytes) {
     return moved;
 }
 
-const Heap kProgramHeap{[](std::size_t bytes) { return std::malloc(bytes); },
-                        [](std::size_t count, std::size_t bytes) { return std::calloc(count, bytes); },
-                        [](void* block, std::size_t bytes) { return std::realloc(block, bytes); },
-                        [](void* block) { std::free(block); }};
-
-}  // namespace
-
-std::size_t live() {
-    return counter().blocks.size();
-}
-std::uint64_t total() {
-    return counter().total;
-}
-void fail_after(long n) {
-    counter().countdown = n < 0 ? -1 : n;
-}
-
-namespace {
-
-#if defined(_WIN32)
 // The rerouted imports call the functions they replaced. Every DLL imports
 // the same msvcrt, so one set of them serves every rerouted module.
 Heap g_module_heap{};
