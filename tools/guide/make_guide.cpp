@@ -93,15 +93,36 @@ std::string intro(const std::vector<std::string>& readme) {
     return out;
 }
 
-// The section's text without its table.
-std::string prose(const std::vector<std::string>& lines) {
+// The section's text, with `items` in place of its table.
+std::string prose(const std::vector<std::string>& lines, const std::string& items = "") {
     std::string out;
+    bool in_table = false;
     for (const std::string& line : lines) {
-        if (line.rfind('|', 0) != 0) {
+        const bool row = line.rfind('|', 0) == 0;
+        if (row && !in_table) {
+            out += items;
+        } else if (!row) {
             out += plain(line) + "\n";
         }
+        in_table = row;
     }
     return out;
+}
+
+// A table cell as an indented paragraph of lines of at most 80 columns.
+std::string wrap(const std::string& text) {
+    constexpr std::size_t kWidth = 80;
+    const std::string indent = "    ";
+    std::string out, line = indent;
+    std::istringstream words(plain(text));
+    for (std::string word; words >> word;) {
+        if (line.size() > indent.size() && line.size() + 1 + word.size() > kWidth) {
+            out += line + "\n";
+            line = indent;
+        }
+        line += (line.size() > indent.size() ? " " : "") + word;
+    }
+    return out + line + "\n";
 }
 
 const char* kind_name(cat::Kind k) {
@@ -123,7 +144,7 @@ std::string events(const std::vector<std::string>& lines) {
     const auto rows = table(lines);
     check(rows.size() == cat::kEvents.size(),
           std::to_string(rows.size()) + " rows in the event table, " + std::to_string(cat::kEvents.size()) + " events");
-    std::string out = prose(lines);
+    std::string items;
     for (std::size_t i = 0; i < rows.size(); ++i) {
         const cat::Event& e = cat::kEvents[i];
         const std::vector<std::string>& row = rows[i];
@@ -136,29 +157,29 @@ std::string events(const std::vector<std::string>& lines) {
         for (std::size_t p = 0; p < e.param_count; ++p) {
             titles += (p == 0 ? "" : ", ") + ("\"" + std::string(e.params[p].title) + "\"");
         }
-        out += "\n" + std::string(kind_name(e.kind)) + " " + display + "\n";
+        items += std::string(kind_name(e.kind)) + " " + display + "\n";
         if (e.param_count != 0) {
-            out += "    parameters: " + plain(row[2]) + " (asked as " + titles + ")\n";
+            items += wrap("parameters: " + row[2] + " (asked as " + titles + ")");
         }
         if (e.kind != cat::Kind::action) {
-            out += "    result: " + row[3] + "\n";
+            items += wrap("result: " + row[3]);
         }
-        out += "    " + plain(row[4]) + "\n";
+        items += wrap(row[4]) + "\n";
     }
-    return out;
+    return prose(lines, items);
 }
 
 std::string options(const std::vector<std::string>& lines) {
     const auto rows = table(lines);
-    std::string out = prose(lines);
+    std::string items;
     std::size_t n = 0;
     for (; cat::kOptions[n].name != nullptr; ++n) {
         const std::string name = "\"" + std::string(cat::kOptions[n].name) + "\"";
         check(n < rows.size() && rows[n].size() >= 2 && rows[n][0] == name, "option " + name);
-        out += "\n" + name + "\n    " + plain(rows[n][1]) + "\n";
+        items += name + "\n" + wrap(rows[n][1]) + "\n";
     }
     check(n == rows.size(), std::to_string(rows.size()) + " rows in the option table");
-    return out;
+    return prose(lines, items);
 }
 
 std::string heading(const std::string& title, char rule) {
@@ -184,11 +205,18 @@ int main(int argc, char** argv) {
         const std::string version = argv[2];
         std::string guide = heading("Sorvel " + version + ": a guide for game developers", '=');
         guide += intro(readme) + "\n";
-        guide += heading("Installing", '-') + prose(section(readme, "Installing the DLL")) + "\n";
+        std::string installing = prose(section(readme, "Installing the DLL"));
+        for (std::size_t at; (at = installing.find("VERSION")) != std::string::npos;) {
+            installing.replace(at, 7, version);
+        }
+        guide += heading("Installing", '-') + installing + "\n";
         guide += heading("The two options", '-') + options(section(readme, "The two options")) + "\n";
         guide += heading("Events", '-') + events(section(readme, "Events")) + "\n";
         guide += heading("Results at the edges", '-') + prose(section(readme, "Results at the edges"));
         guide += "\nSorvel " + version + ". Licence: see LICENSE. Checksums: SHA256SUMS.\n";
+        for (std::size_t at; (at = guide.find("\n\n\n")) != std::string::npos;) {
+            guide.erase(at, 1);  // one blank line between paragraphs
+        }
         std::ofstream out(argv[3], std::ios::binary);
         if (!(out << guide) || !out.flush()) {
             throw std::runtime_error(std::string("cannot write ") + argv[3]);
