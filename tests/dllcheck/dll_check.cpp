@@ -115,7 +115,8 @@ Headers parse_headers(const std::string& text) {
 struct Image {
     std::map<unsigned long, unsigned char> bytes;
     std::map<std::string, unsigned long> symbols;
-    std::map<unsigned long, std::string> functions;  // address -> name
+    std::map<unsigned long, std::string> functions;                           // address -> name
+    std::map<std::string, std::pair<unsigned long, unsigned long>> sections;  // name -> [start, end)
     unsigned long word_at(unsigned long address) const {
         unsigned long w = 0;
         for (unsigned long i = 4; i-- > 0;) {
@@ -127,7 +128,7 @@ struct Image {
 };
 
 Image parse_image(const std::string& sections, const std::string& symbols, const std::string& contents) {
-    static const std::regex section(R"(^\s+(\d+) \S+\s+[0-9a-f]+\s+([0-9a-f]+))"),
+    static const std::regex section(R"(^\s+(\d+) (\S+)\s+([0-9a-f]+)\s+([0-9a-f]+))"),
         symbol(R"(\(sec\s+(\d+)\)\(fl 0x[0-9a-f]+\)\(ty\s+(\d+)\).*0x([0-9a-f]+) (\S+)$)"),
         line(R"(^ ([0-9a-f]+) ((?:[0-9a-f]+ ?){1,4}))");
     Image image;
@@ -136,7 +137,9 @@ Image parse_image(const std::string& sections, const std::string& symbols, const
     std::istringstream in(sections + symbols + contents);
     for (std::string text; std::getline(in, text);) {
         if (std::regex_search(text, m, section)) {
-            vma[std::stoi(m[1]) + 1] = std::stoul(m[2], nullptr, 16);
+            const unsigned long start = std::stoul(m[4], nullptr, 16);
+            vma[std::stoi(m[1]) + 1] = start;
+            image.sections[m[2]] = {start, start + std::stoul(m[3], nullptr, 16)};
         } else if (std::regex_search(text, m, symbol)) {
             const unsigned long address = vma[std::stoi(m[1])] + std::stoul(m[3], nullptr, 16);
             image.symbols[m[4]] = address;
@@ -342,19 +345,8 @@ TEST_F(ProductDll, ShipsWithoutSymbolsAndLinksToThem) {
 // reads or writes data of the DLL's own, so no counter or countdown is left.
 TEST_F(ProductDll, AllocationSeamKeepsNoCounter) {
     static const std::regex address(R"(0x([0-9a-f]{5,}))"), callee(R"(<([^>]+)>)");
-    unsigned long data_low = ~0UL, data_high = 0;  // .data to .bss and every writable section between
-    for (const std::string& name : {std::string(".data"), std::string(".bss")}) {
-        static const std::regex row(R"(^\s+\d+ (\S+)\s+([0-9a-f]+)\s+([0-9a-f]+))");
-        std::istringstream in(objdump("-h"));
-        std::smatch m;
-        for (std::string line; std::getline(in, line);) {
-            if (std::regex_search(line, m, row) && m[1] == name) {
-                data_low = std::min(data_low, std::stoul(m[3], nullptr, 16));
-                data_high = std::max(data_high, std::stoul(m[3], nullptr, 16) + std::stoul(m[2], nullptr, 16));
-            }
-        }
-    }
-    ASSERT_LT(data_low, data_high);
+    // .data to .bss, and every section between.
+    const unsigned long data_low = image_->sections[".data"].first, data_high = image_->sections[".bss"].second;
     for (const auto& [symbol, thunk] :
          {std::pair{"__ZN6sorvel6memory8allocateEj", "_malloc"}, std::pair{"__ZN6sorvel6memory7releaseEPv", "_free"}}) {
         const auto found = functions_->find(symbol);

@@ -21,7 +21,7 @@
 #include <stdexcept>
 #endif
 
-namespace sorvel::test::counting {
+namespace sorvel::testhost::counting {
 namespace {
 
 // The C runtime that the counted blocks come from and go back to.
@@ -191,23 +191,23 @@ bool reroute(void*) {
 #endif
 
 // Tells the test host about the counter as the program starts.
-const testhost::Library::Counter kCounter{{&live, &fail_after, &total}, &reroute};
-[[maybe_unused]] const bool g_installed = (testhost::Library::use_counter(&kCounter), true);
+const Library::Counter kCounter{{&live, &fail_after, &total}, &reroute};
+[[maybe_unused]] const bool g_installed = (Library::use_counter(&kCounter), true);
 
 }  // namespace
-}  // namespace sorvel::test::counting
+}  // namespace sorvel::testhost::counting
 
 // The library's allocation seam, in place of the product's: the archive's
 // memory object is never linked into a program that links this one.
 namespace sorvel::memory {
 
 void* allocate(std::size_t bytes) noexcept {
-    return test::counting::allocate(test::counting::kProgramHeap, bytes == 0 ? 1 : bytes);
+    return testhost::counting::allocate(testhost::counting::kProgramHeap, bytes == 0 ? 1 : bytes);
 }
 
 void release(void* block) noexcept {
     if (block != nullptr) {
-        test::counting::release(test::counting::kProgramHeap, block);
+        testhost::counting::release(testhost::counting::kProgramHeap, block);
     }
 }
 
