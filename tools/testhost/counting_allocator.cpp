@@ -1,12 +1,13 @@
 // The counter, the library's allocation seam for programs that link it in,
 // and the rerouting of a loaded DLL's imports of malloc, calloc, realloc and
-// free. The blocks it made are known by address, so a block that the library
-// allocated before its imports were rerouted, and frees after, passes to the
-// C runtime uncounted. One thread at a time calls the library.
+// free. Every block of the seam comes through the counter, so a count does
+// for them, as cheap as the benchmarks need. A DLL's blocks are known by
+// address: one that its C runtime allocated before the imports were
+// rerouted, and frees after, passes to the C runtime uncounted. One thread at
+// a time calls the library.
 #include "counting_allocator.hpp"
 
 #include <cstdlib>
-#include <unordered_set>
 
 #include "collections/memory.hpp"
 #include "test_host.hpp"
@@ -19,110 +20,98 @@
 
 #include <cstring>
 #include <stdexcept>
+#include <unordered_set>
 #endif
 
 namespace sorvel::testhost::counting {
 namespace {
 
-// The C runtime that the counted blocks come from and go back to.
+std::size_t g_live = 0;  // the seam's blocks
+std::uint64_t g_total = 0;
+long g_countdown = -1;
+
+bool fails() {
+    return g_countdown >= 0 && g_countdown-- == 0;
+}
+
+void* counted(void* block) {
+    g_total += block != nullptr ? 1 : 0;
+    return block;
+}
+
+#if defined(_WIN32)
+// Never destroyed: a DLL frees its blocks after the program's own static
+// objects are gone.
+std::unordered_set<void*>& module_blocks() {
+    static auto* blocks = new std::unordered_set<void*>();
+    return *blocks;
+}
+#endif
+
+}  // namespace
+
+std::size_t live() {
+#if defined(_WIN32)
+    return g_live + module_blocks().size();
+#else
+    return g_live;
+#endif
+}
+std::uint64_t total() {
+    return g_total;
+}
+void fail_after(long n) {
+    g_countdown = n < 0 ? -1 : n;
+}
+
+namespace {
+
+#if defined(_WIN32)
+// The C runtime functions that the rerouted imports replaced. Every DLL
+// imports the same msvcrt, so one set of them serves every rerouted module.
 struct Heap {
     void* (*malloc)(std::size_t);
     void* (*calloc)(std::size_t, std::size_t);
     void* (*realloc)(void*, std::size_t);
     void (*free)(void*);
 };
-
-struct Counter {
-    std::unordered_set<void*> blocks;
-    std::uint64_t total = 0;
-    long countdown = -1;
-
-    bool fails() { return countdown >= 0 && countdown-- == 0; }
-    void* counted(void* block) {
-        if (block != nullptr) {
-            blocks.insert(block);
-            ++total;
-        }
-        return block;
-    }
-};
-
-// Never destroyed: a DLL may free its blocks after the program's own
-// static objects are gone.
-Counter& counter() {
-    static auto* c = new Counter();
-    return *c;
-}
-
-void* allocate(const Heap& heap, std::size_t bytes) {
-    return counter().fails() ? nullptr : counter().counted(heap.malloc(bytes));
-}
-
-void release(const Heap& heap, void* block) {
-    counter().blocks.erase(block);
-    heap.free(block);
-}
-
-const Heap kProgramHeap{[](std::size_t bytes) { return std::malloc(bytes); },
-                        [](std::size_t count, std::size_t bytes) { return std::calloc(count, bytes); },
-                        [](void* block, std::size_t bytes) { return std::realloc(block, bytes); },
-                        [](void* block) { std::free(block); }};
-
-}  // namespace
-
-std::size_t live() {
-    return counter().blocks.size();
-}
-std::uint64_t total() {
-    return counter().total;
-}
-void fail_after(long n) {
-    counter().countdown = n < 0 ? -1 : n;
-}
-
-namespace {
-
-#if defined(_WIN32)
-void* allocate_zeroed(const Heap& heap, std::size_t count, std::size_t bytes) {
-    return counter().fails() ? nullptr : counter().counted(heap.calloc(count, bytes));
-}
-
-// msvcrt's realloc: null allocates, size 0 frees. A block allocated before
-// the rerouting stays uncounted when it moves.
-void* reallocate(const Heap& heap, void* block, std::size_t bytes) {
-    if (block == nullptr) {
-        return allocate(heap, bytes);
-    }
-    if (bytes == 0) {
-        release(heap, block);
-        return nullptr;
-    }
-    Counter& c = counter();
-    if (c.fails()) {
-        return nullptr;
-    }
-    void* moved = heap.realloc(block, bytes);
-    if (moved != nullptr && c.blocks.erase(block) == 1) {
-        c.counted(moved);
-    }
-    return moved;
-}
-
-// The rerouted imports call the functions they replaced. Every DLL imports
-// the same msvcrt, so one set of them serves every rerouted module.
 Heap g_module_heap{};
 
+void* module_block(void* block) {
+    if (counted(block) != nullptr) {
+        module_blocks().insert(block);
+    }
+    return block;
+}
+
 void* counted_malloc(std::size_t bytes) {
-    return allocate(g_module_heap, bytes);
+    return fails() ? nullptr : module_block(g_module_heap.malloc(bytes));
 }
 void* counted_calloc(std::size_t count, std::size_t bytes) {
-    return allocate_zeroed(g_module_heap, count, bytes);
-}
-void* counted_realloc(void* block, std::size_t bytes) {
-    return reallocate(g_module_heap, block, bytes);
+    return fails() ? nullptr : module_block(g_module_heap.calloc(count, bytes));
 }
 void counted_free(void* block) {
-    release(g_module_heap, block);
+    module_blocks().erase(block);
+    g_module_heap.free(block);
+}
+// msvcrt's realloc: null allocates, size 0 frees. A block from before the
+// rerouting stays uncounted when it moves.
+void* counted_realloc(void* block, std::size_t bytes) {
+    if (block == nullptr) {
+        return counted_malloc(bytes);
+    }
+    if (bytes == 0) {
+        counted_free(block);
+        return nullptr;
+    }
+    if (fails()) {
+        return nullptr;
+    }
+    void* moved = g_module_heap.realloc(block, bytes);
+    if (moved != nullptr && module_blocks().erase(block) == 1) {
+        module_block(moved);
+    }
+    return moved;
 }
 
 template <class T>
@@ -202,12 +191,19 @@ const Library::Counter kCounter{{&live, &fail_after, &total}, &reroute};
 namespace sorvel::memory {
 
 void* allocate(std::size_t bytes) noexcept {
-    return testhost::counting::allocate(testhost::counting::kProgramHeap, bytes == 0 ? 1 : bytes);
+    using namespace testhost::counting;
+    if (fails()) {
+        return nullptr;
+    }
+    void* block = counted(std::malloc(bytes == 0 ? 1 : bytes));
+    g_live += block != nullptr ? 1 : 0;
+    return block;
 }
 
 void release(void* block) noexcept {
     if (block != nullptr) {
-        testhost::counting::release(testhost::counting::kProgramHeap, block);
+        --testhost::counting::g_live;
+        std::free(block);
     }
 }
 

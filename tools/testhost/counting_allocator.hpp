@@ -3,7 +3,8 @@
 // stands behind the library's allocation seam (sorvel::memory) in place of
 // the product's and, on Windows, reroutes a loaded DLL's C runtime allocator
 // imports through the same counter. Either way the test host hands it out as
-// Library::allocations(); sorvel-host and the benchmarks do without it.
+// Library::allocations(). The benchmarks fail allocations through it too;
+// sorvel-host does without it.
 #pragma once
 
 #include <cstddef>
