@@ -2,9 +2,11 @@
 // driver: the corpus is the regression suite on every target, sanitizers,
 // emulators and valgrind included.
 //
-//   fuzz_replay [--library PATH] FILE_OR_FOLDER...
+//   fuzz_replay [--library PATH [--relocate]] FILE_OR_FOLDER...
 //
-// --library drives a library the test host loads instead of the one linked in.
+// --library drives a library the test host loads instead of the one linked in;
+// --relocate keeps a Windows DLL off its preferred base, so that the loader
+// applies its relocations.
 #include <algorithm>
 #include <cstdio>
 #include <exception>
@@ -18,12 +20,17 @@
 
 int main(int argc, char** argv) {
     namespace fs = std::filesystem;
+    using sorvel::testhost::Library;
     std::vector<fs::path> inputs;
+    std::string library;
+    Library::Placement placement = Library::Placement::preferred;
     try {
         for (int i = 1; i < argc; ++i) {
             const std::string arg = argv[i];
             if (arg == "--library" && i + 1 < argc) {
-                fuzzdriver::library() = sorvel::testhost::Library::load(argv[++i]);
+                library = argv[++i];
+            } else if (arg == "--relocate") {
+                placement = Library::Placement::away_from_preferred_base;
             } else if (fs::is_directory(arg)) {
                 for (const fs::directory_entry& e : fs::directory_iterator(arg)) {
                     inputs.push_back(e.path());
@@ -32,12 +39,15 @@ int main(int argc, char** argv) {
                 inputs.emplace_back(arg);
             }
         }
+        if (!library.empty()) {
+            fuzzdriver::library() = Library::load(library, placement);
+        }
     } catch (const std::exception& e) {
         std::fprintf(stderr, "fuzz_replay: %s\n", e.what());
         return 2;
     }
     if (inputs.empty()) {
-        std::fprintf(stderr, "usage: fuzz_replay [--library PATH] FILE_OR_FOLDER...\n");
+        std::fprintf(stderr, "usage: fuzz_replay [--library PATH [--relocate]] FILE_OR_FOLDER...\n");
         return 2;
     }
     if (fuzzdriver::library()->allocations() == nullptr) {

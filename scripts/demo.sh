@@ -5,7 +5,7 @@ set -euo pipefail
 cd "$(dirname "$0")/.."
 bash scripts/setup.sh
 cmake --preset windows-x86 >/dev/null
-cmake --build --preset windows-x86 -j "$(nproc)"
+cmake --build --preset windows-x86 --target sorvel -j "$(nproc)"
 cmake --preset native-plain >/dev/null
 cmake --build --preset native-plain -j "$(nproc)"
 echo "product DLL: build/windows-x86/sorvel.dll"

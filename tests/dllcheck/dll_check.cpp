@@ -1,12 +1,17 @@
 // Static checks of the product: the 32-bit Windows DLL that the host loads,
-// read with objdump, never run:
+// read with objdump, never run. The DLL ships stripped; its symbols come
+// from sorvel.dll.debug beside it.
 //  - the export table holds exactly the host's names and ordinals, undecorated,
 //    each at its stdcall function;
 //  - the three handler tables hold the handlers the catalogue names, in its
 //    order, then a null;
 //  - every export, DllMain and every handler removes its own arguments: each
 //    of its returns is `ret 4*n`, following tail jumps;
-//  - it imports only from Windows system DLLs, so it loads on a bare system;
+//  - it imports only these functions of Windows system DLLs, so it loads on a
+//    bare system;
+//  - it has no symbols or debug sections, only a debug link to its symbols;
+//  - its allocation seam hands blocks straight to the C runtime: no counter
+//    or countdown;
 //  - its version resource names the product and the project version, and no
 //    company or copyright.
 // Usage: sorvel_dll_check [gtest flags] PATH/TO/sorvel.dll
@@ -30,17 +35,18 @@
 namespace {
 
 std::string g_dll;
+std::string g_debug;  // its symbols
 
 std::string decorated(const std::string& name, int args) {
     return "_" + name + "@" + std::to_string(4 * args);
 }
 
-// The output of `objdump FLAG dll`; empty with a failure when it cannot run.
-std::string objdump(const std::string& flag) {
+// The output of `objdump FLAG file`; empty with a failure when it cannot run.
+std::string objdump(const std::string& flag, const std::string& file = g_dll) {
     const char* chosen = std::getenv("SORVEL_OBJDUMP");
     const std::string command =
         std::string(chosen != nullptr && *chosen != '\0' ? chosen : "i686-w64-mingw32-objdump") + " " + flag + " '" +
-        g_dll + "' 2>/dev/null";
+        file + "' 2>/dev/null";
     FILE* pipe = popen(command.c_str(), "r");
     std::string out;
     char buffer[65536];
@@ -104,27 +110,88 @@ Headers parse_headers(const std::string& text) {
     return h;
 }
 
-// What -d tells: each label's address and instructions ("ret $0x8",
-// "jmp 6db82960 <_Other@8>").
+// A word of the image at an address, read from -s of the DLL; a symbol's
+// address from -t of its symbols and the sections' addresses from -h.
+struct Image {
+    std::map<unsigned long, unsigned char> bytes;
+    std::map<std::string, unsigned long> symbols;
+    std::map<unsigned long, std::string> functions;                           // address -> name
+    std::map<std::string, std::pair<unsigned long, unsigned long>> sections;  // name -> [start, end)
+    unsigned long word_at(unsigned long address) const {
+        unsigned long w = 0;
+        for (unsigned long i = 4; i-- > 0;) {
+            const auto b = bytes.find(address + i);
+            w = w << 8U | (b == bytes.end() ? 0U : b->second);
+        }
+        return w;
+    }
+};
+
+Image parse_image(const std::string& sections, const std::string& symbols, const std::string& contents) {
+    static const std::regex section(R"(^\s+(\d+) (\S+)\s+([0-9a-f]+)\s+([0-9a-f]+))"),
+        symbol(R"(\(sec\s+(\d+)\)\(fl 0x[0-9a-f]+\)\(ty\s+(\d+)\).*0x([0-9a-f]+) (\S+)$)"),
+        line(R"(^ ([0-9a-f]+) ((?:[0-9a-f]+ ?){1,4}))");
+    Image image;
+    std::map<int, unsigned long> vma;
+    std::smatch m;
+    std::istringstream in(sections + symbols + contents);
+    for (std::string text; std::getline(in, text);) {
+        if (std::regex_search(text, m, section)) {
+            const unsigned long start = std::stoul(m[4], nullptr, 16);
+            vma[std::stoi(m[1]) + 1] = start;
+            image.sections[m[2]] = {start, start + std::stoul(m[3], nullptr, 16)};
+        } else if (std::regex_search(text, m, symbol)) {
+            const unsigned long address = vma[std::stoi(m[1])] + std::stoul(m[3], nullptr, 16);
+            image.symbols[m[4]] = address;
+            if (m[2] == "20") {  // a function
+                image.functions[address] = m[4];
+            }
+        } else if (std::regex_search(text, m, line)) {
+            unsigned long at = std::stoul(m[1], nullptr, 16);
+            std::string hex = m[2];
+            hex.erase(std::remove(hex.begin(), hex.end(), ' '), hex.end());
+            for (std::size_t i = 0; i + 1 < hex.size(); i += 2) {
+                image.bytes[at++] = static_cast<unsigned char>(std::stoul(hex.substr(i, 2), nullptr, 16));
+            }
+        }
+    }
+    return image;
+}
+
+// What -d of the stripped DLL tells, cut into functions at the symbols'
+// addresses: each function's address and instructions ("ret $0x8",
+// "jmp 0x6db82960"), a jump's target named when a function starts there.
 struct Function {
     unsigned long address = 0;
     std::vector<std::string> instructions;
 };
 
-std::map<std::string, Function> parse_disassembly(const std::string& text) {
-    static const std::regex label(R"(^([0-9a-f]+) <(.+)>:$)"),
-        instruction(R"(^\s*[0-9a-f]+:\t[0-9a-f ]+\t(?:(?:repz|rep|bnd|notrack) )?(\S.*)$)");
+std::map<std::string, Function> parse_disassembly(const std::string& text, const Image& image) {
+    static const std::regex instruction(R"(^\s*([0-9a-f]+):\t[0-9a-f ]+\t(?:(?:repz|rep|bnd|notrack) )?(\S.*?)\s*$)"),
+        target(R"(^(j\w+|call)\s+0x([0-9a-f]+)$)");
     std::map<std::string, Function> functions;
-    Function* at = nullptr;
     std::istringstream in(text);
     std::smatch m;
     for (std::string line; std::getline(in, line);) {
-        if (std::regex_match(line, m, label)) {
-            at = &functions[m[2]];
-            at->address = std::stoul(m[1], nullptr, 16);
-        } else if (at != nullptr && std::regex_match(line, m, instruction)) {
-            at->instructions.push_back(m[1]);
+        if (!std::regex_match(line, m, instruction)) {
+            continue;
         }
+        const unsigned long address = std::stoul(m[1], nullptr, 16);
+        auto owner = image.functions.upper_bound(address);
+        if (owner == image.functions.begin()) {
+            continue;
+        }
+        --owner;
+        Function& f = functions[owner->second];
+        f.address = owner->first;
+        std::string ins = m[2];
+        if (std::regex_match(ins, m, target)) {
+            const auto callee = image.functions.find(std::stoul(m[2], nullptr, 16));
+            if (callee != image.functions.end()) {
+                ins += " <" + callee->second + ">";
+            }
+        }
+        f.instructions.push_back(ins);
     }
     return functions;
 }
@@ -134,7 +201,7 @@ std::map<std::string, Function> parse_disassembly(const std::string& text) {
 // other functions, checked the same way.
 void expect_callee_cleanup(const std::map<std::string, Function>& functions, const std::string& symbol, int args,
                            std::set<std::string>& seen) {
-    static const std::regex ret(R"(^retl?\s*(\S*))"), jump(R"(^jmp\s+[0-9a-f]+ <([^+>]+)>)");
+    static const std::regex ret(R"(^retl?\s*(\S*))"), jump(R"(^jmp\s+0x[0-9a-f]+ <([^>]+)>)");
     const auto found = functions.find(symbol);
     if (!seen.insert(symbol).second || found == functions.end()) {
         EXPECT_NE(found, functions.end()) << "no function " << symbol;
@@ -161,45 +228,6 @@ void expect_callee_cleanup(const std::map<std::string, Function>& functions, con
     }
 }
 
-// A word of the image at an address, read from -s; a symbol's address from -t
-// and the sections' addresses from -h.
-struct Image {
-    std::map<unsigned long, unsigned char> bytes;
-    std::map<std::string, unsigned long> symbols;
-    unsigned long word_at(unsigned long address) const {
-        unsigned long w = 0;
-        for (unsigned long i = 4; i-- > 0;) {
-            const auto b = bytes.find(address + i);
-            w = w << 8U | (b == bytes.end() ? 0U : b->second);
-        }
-        return w;
-    }
-};
-
-Image parse_image(const std::string& sections, const std::string& symbols, const std::string& contents) {
-    static const std::regex section(R"(^\s+(\d+) \S+\s+[0-9a-f]+\s+([0-9a-f]+))"),
-        symbol(R"(\(sec\s+(\d+)\).*0x([0-9a-f]+) (\S+)$)"), line(R"(^ ([0-9a-f]+) ((?:[0-9a-f]+ ?){1,4}))");
-    Image image;
-    std::map<int, unsigned long> vma;
-    std::smatch m;
-    std::istringstream in(sections + symbols + contents);
-    for (std::string text; std::getline(in, text);) {
-        if (std::regex_search(text, m, section)) {
-            vma[std::stoi(m[1]) + 1] = std::stoul(m[2], nullptr, 16);
-        } else if (std::regex_search(text, m, symbol)) {
-            image.symbols[m[3]] = vma[std::stoi(m[1])] + std::stoul(m[2], nullptr, 16);
-        } else if (std::regex_search(text, m, line)) {
-            unsigned long at = std::stoul(m[1], nullptr, 16);
-            std::string hex = m[2];
-            hex.erase(std::remove(hex.begin(), hex.end(), ' '), hex.end());
-            for (std::size_t i = 0; i + 1 < hex.size(); i += 2) {
-                image.bytes[at++] = static_cast<unsigned char>(std::stoul(hex.substr(i, 2), nullptr, 16));
-            }
-        }
-    }
-    return image;
-}
-
 // Conditions and actions take three words, expressions two.
 int handler_args(const sorvel::catalogue::Event& e) {
     return e.kind == sorvel::catalogue::Kind::expression ? 2 : 3;
@@ -209,8 +237,8 @@ class ProductDll : public ::testing::Test {
 protected:
     static void SetUpTestSuite() {
         headers_ = new Headers(parse_headers(objdump("-p")));
-        functions_ = new std::map<std::string, Function>(parse_disassembly(objdump("-d")));
-        image_ = new Image(parse_image(objdump("-h"), objdump("-t"), objdump("-s")));
+        image_ = new Image(parse_image(objdump("-h"), objdump("-t", g_debug), objdump("-s")));
+        functions_ = new std::map<std::string, Function>(parse_disassembly(objdump("-d"), *image_));
     }
     static inline Headers* headers_ = nullptr;
     static inline Image* image_ = nullptr;
@@ -275,16 +303,71 @@ TEST_F(ProductDll, HandlerTablesHoldTheCataloguesHandlersInItsOrder) {
     }
 }
 
-TEST_F(ProductDll, ImportsOnlySystemLibraries) {
-    // No runtime DLL of the compiler (libstdc++, libgcc, winpthread) may be needed.
-    const std::set<std::string> allowed = {"kernel32.dll", "msvcrt.dll", "ntdll.dll", "advapi32.dll", "user32.dll"};
+TEST_F(ProductDll, ImportsOnlyTheseSystemFunctions) {
+    // No runtime DLL of the compiler (libstdc++, libgcc, winpthread) may be
+    // needed, nor any function beyond these. Files are read with ReadFile;
+    // draws come from the C runtime's rand that the host shares; blocks from
+    // the C runtime's allocator, which tests reroute. The rest serves the
+    // start-up code of the C runtime and libgcc, and the compiler's own calls.
+    const std::map<std::string, std::set<std::string>> allowed = {
+        {"kernel32.dll",
+         {"DeleteCriticalSection", "EnterCriticalSection", "FreeLibrary", "GetLastError", "GetModuleHandleA",
+          "GetProcAddress", "InitializeCriticalSection", "LeaveCriticalSection", "LoadLibraryA", "ReadFile", "Sleep",
+          "TlsGetValue", "VirtualProtect", "VirtualQuery"}},
+        {"msvcrt.dll",
+         {"_amsg_exit", "_initterm", "_iob", "_lock", "_unlock", "abort", "calloc", "free", "fwrite", "malloc",
+          "memcpy", "memmove", "memset", "rand", "realloc", "strlen", "strncmp", "vfprintf"}},
+    };
     ASSERT_FALSE(headers_->imports.empty()) << "no import table";
-    for (const auto& [dll, members] : headers_->imports) {
-        EXPECT_EQ(allowed.count(dll), 1U) << "imports from " << dll;
+    for (const auto& [dll, functions] : headers_->imports) {
+        const auto listed = allowed.find(dll);
+        for (const std::string& f : functions) {
+            EXPECT_TRUE(listed != allowed.end() && listed->second.count(f) == 1) << "imports " << dll << "!" << f;
+        }
     }
-    // Files are read with ReadFile, and draws come from the C runtime's rand that the host shares.
+    for (const char* needed : {"malloc", "free", "rand"}) {
+        EXPECT_EQ(headers_->imports["msvcrt.dll"].count(needed), 1U) << needed;
+    }
     EXPECT_EQ(headers_->imports["kernel32.dll"].count("ReadFile"), 1U);
-    EXPECT_EQ(headers_->imports["msvcrt.dll"].count("rand"), 1U);
+}
+
+TEST_F(ProductDll, ShipsWithoutSymbolsAndLinksToThem) {
+    const std::string sections = objdump("-h");
+    EXPECT_EQ(sections.find(".debug_"), std::string::npos) << "debug sections in the DLL";
+    EXPECT_NE(objdump("-t").find("no symbols"), std::string::npos) << "a symbol table in the DLL";
+    const std::string link = objdump("-s -j .gnu_debuglink");
+    EXPECT_NE(link.find("sorvel.dll.debu"), std::string::npos) << "no debug link to sorvel.dll.debug:\n" << link;
+    EXPECT_GT(image_->functions.size(), 100U) << "too few symbols in " << g_debug;
+}
+
+// The seam hands every block straight to the C runtime: each of its two
+// functions calls or jumps to nothing but the import's thunk, and neither
+// reads or writes data of the DLL's own, so no counter or countdown is left.
+TEST_F(ProductDll, AllocationSeamKeepsNoCounter) {
+    static const std::regex address(R"(0x([0-9a-f]{5,}))"), callee(R"(<([^>]+)>)");
+    // .data to .bss, and every section between.
+    const unsigned long data_low = image_->sections[".data"].first, data_high = image_->sections[".bss"].second;
+    for (const auto& [symbol, thunk] :
+         {std::pair{"__ZN6sorvel6memory8allocateEj", "_malloc"}, std::pair{"__ZN6sorvel6memory7releaseEPv", "_free"}}) {
+        const auto found = functions_->find(symbol);
+        ASSERT_NE(found, functions_->end()) << "no function " << symbol;
+        for (const std::string& ins : found->second.instructions) {
+            std::smatch m;
+            if (ins.rfind("jmp", 0) == 0 || ins.rfind("call", 0) == 0) {
+                EXPECT_TRUE(std::regex_search(ins, m, callee) && m[1] == thunk) << symbol << ": " << ins;
+                continue;
+            }
+            for (auto it = std::sregex_iterator(ins.begin(), ins.end(), address); it != std::sregex_iterator(); ++it) {
+                const unsigned long at = std::stoul((*it)[1], nullptr, 16);
+                EXPECT_FALSE(at >= data_low && at < data_high) << symbol << " touches data: " << ins;
+            }
+        }
+    }
+    for (const char* name : {"live_allocations", "total_allocations", "fail_allocation_after", "countdown"}) {
+        for (const auto& [symbol, at] : image_->symbols) {
+            EXPECT_EQ(symbol.find(name), std::string::npos) << symbol;
+        }
+    }
 }
 
 // The .rsrc section's bytes, from objdump's hex dump: an address, then up to
@@ -340,11 +423,14 @@ int main(int argc, char** argv) {
         return 2;
     }
     g_dll = argv[1];
-    if (FILE* f = std::fopen(g_dll.c_str(), "rb")) {
-        std::fclose(f);
-    } else {
-        std::fprintf(stderr, "%s: cannot read %s (build the windows-x86 preset first)\n", argv[0], g_dll.c_str());
-        return 2;
+    g_debug = g_dll + ".debug";
+    for (const std::string& file : {g_dll, g_debug}) {
+        if (FILE* f = std::fopen(file.c_str(), "rb")) {
+            std::fclose(f);
+        } else {
+            std::fprintf(stderr, "%s: cannot read %s (build the windows-x86 preset first)\n", argv[0], file.c_str());
+            return 2;
+        }
     }
     return RUN_ALL_TESTS();
 }

@@ -92,7 +92,7 @@ TEST_F(HostTest, InformationBlockAndHandlerTables) {
 // An instance whose reader or indexes could not be had still serves every
 // event, as with the option off, and destruction frees what was had.
 TEST(Creation, WithoutMemoryEveryEventStillWorks) {
-    Host host(Library::linked_in());
+    Host host(sorvel::test::counted_library());
     const auto* allocations = host.library().allocations();
     ASSERT_NE(allocations, nullptr);
     const std::size_t live = allocations->live();

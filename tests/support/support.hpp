@@ -6,6 +6,7 @@
 #include <array>
 #include <cstdint>
 #include <cstring>
+#include <memory>
 #include <new>
 #include <string>
 #include <type_traits>
@@ -125,6 +126,13 @@ void link_chain(Holder<V>& h, const std::vector<int>& directions) {
         deepest = node;
         ++h.count;
     }
+}
+
+// The built library where its allocations can be counted (a Windows DLL,
+// through its rerouted imports), else the library linked in.
+inline std::shared_ptr<testhost::Library> counted_library() {
+    const auto built = testhost::Library::built();
+    return built->allocations() != nullptr ? built : testhost::Library::linked_in();
 }
 
 // Calls an export with the first `n` of seven words.

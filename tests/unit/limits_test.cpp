@@ -7,7 +7,7 @@
 #include <string>
 #include <vector>
 
-#include "collections/memory.hpp"
+#include "counting_allocator.hpp"
 #include "loading/load_lines.hpp"
 #include "model.hpp"
 #include "support.hpp"
@@ -40,7 +40,7 @@ std::vector<int> directions(std::size_t n, int pattern) {
 // along it would overflow; everything is freed at the end.
 template <class V>
 void deep_chain(int pattern) {
-    const std::size_t live = memory::live_allocations();
+    const std::size_t live = testhost::counting::live();
     const std::vector<int> steps = directions(kDeep, pattern);
     ASSERT_TRUE(sorvel::testing::run_on_small_stack([&] {
         Holder<V> h;
@@ -68,7 +68,7 @@ void deep_chain(int pattern) {
         }
         EXPECT_EQ(h.count, static_cast<std::int32_t>(kDeep + 1));
     })) << "the work on the small stack did not finish";
-    EXPECT_EQ(memory::live_allocations(), live);
+    EXPECT_EQ(testhost::counting::live(), live);
 }
 
 TEST(DeepChains, WorkAndFreeOnASmallStack) {

@@ -8,15 +8,11 @@
 // reseed. Its values span 0 to 2^31 - 1 like glibc's, so the library's own
 // cut to 15 bits is exercised.
 //
-// A Windows DLL that the 32-bit x86 test host maps draws from the host's own
-// msvcrt rand. When this file is part of the program it takes those draws
-// over too: scripted values first, then msvcrt's generator, which reseed
-// seeds while an image is mapped.
-//
-// Windows: the program and the DLL share the C runtime DLL's rand and its
-// state, and neither can be replaced. reseed seeds it, learns the sequence
-// that follows (far more values than asked for) and seeds it again, so the
-// library draws exactly the learnt values from the first on. made() then
+// Windows: the program and the library, linked in or a DLL, share msvcrt's
+// rand and its state, which the program does not replace. reseed seeds it,
+// learns the sequence that follows (far more values than asked for) and
+// seeds it again, so the library draws exactly the learnt values from the
+// first on. made() then
 // draws a few values itself, finds where they stand in the learnt sequence
 // (that position is the number of draws the library made) and seeds again
 // and draws up to that position, which leaves the generator as it found it.
@@ -28,11 +24,6 @@
 #include <vector>
 
 #include "test_host.hpp"
-
-#if defined(__i386__) && !defined(_WIN32)
-#include "pe_image.hpp"
-#define DRAWS_FOR_IMAGES 1
-#endif
 
 namespace sorvel::testhost::draws {
 namespace {
@@ -70,16 +61,6 @@ std::vector<int> reseed(unsigned seed, std::size_t n) {
     g_state = state_for(seed);
     g_made = 0;
     std::vector<int> values(n);
-#if defined(DRAWS_FOR_IMAGES)
-    runtime::generator() = seed;
-    if (runtime::images() != 0) {
-        std::uint32_t ahead = seed;
-        for (int& v : values) {
-            v = runtime::step(ahead);
-        }
-        return values;
-    }
-#endif
     std::uint64_t ahead = g_state;
     for (int& v : values) {
         v = generate(ahead) & kMask;
@@ -106,19 +87,8 @@ int next_value() {
     if (g_scripted < g_script.size()) {
         return g_script[g_scripted++];
     }
-#if defined(DRAWS_FOR_IMAGES)
-    if (runtime::images() != 0) {
-        return runtime::step(runtime::generator());
-    }
-#endif
     return generate(g_state);
 }
-
-#if defined(DRAWS_FOR_IMAGES)
-namespace {
-[[maybe_unused]] const bool g_hooked = (runtime::draw_hook = &next_value, true);
-}  // namespace
-#endif
 
 }  // namespace sorvel::testhost::draws
 

@@ -3,7 +3,6 @@
 // a statically linked Windows program has no export table to search. This
 // object is pulled in only by programs that call Library::linked_in, which
 // are the ones that link the library.
-#include "collections/memory.hpp"
 #include "host/exports.hpp"
 #include "test_host.hpp"
 
@@ -20,10 +19,8 @@ extern "C" word SORVEL_CALL DllMain(word, word, word);
 namespace sorvel::testhost {
 
 std::shared_ptr<Library> Library::linked_in() {
-    static constexpr Allocations kOwnCounter{&memory::live_allocations, &memory::fail_allocation_after,
-                                             &memory::total_allocations};
     std::shared_ptr<Library> library(new Library());
-    library->allocations_ = &kOwnCounter;
+    library->allocations_ = counter() != nullptr ? &counter()->allocations : nullptr;
 #define TESTHOST_ENTRY(name, ordinal, ...) library->symbols_.push_back(Symbol{#name, reinterpret_cast<void*>(&name)});
     SORVEL_EXPORT_LIST(TESTHOST_ENTRY)
     SORVEL_STUB_LIST(TESTHOST_ENTRY)

@@ -3,16 +3,25 @@
  * whether it did. cdecl itself:
  *   word sorvel_testhost_stdcall_call(void* fn, const word* args, word count,
  *                                     word* delta)
- * The arguments are pushed right to left onto a 16-byte aligned stack, as
- * the i386 System V ABI expects at a call. *delta receives the stack pointer
- * after the call minus the stack pointer before the first push: 0 when the
- * callee removed exactly its arguments. The caller's stack pointer is
- * restored whatever the callee did, so a wrong callee is counted, not fatal.
+ * The arguments are pushed right to left onto a 16-byte aligned stack, which
+ * suits both the i386 System V ABI and Windows (4 bytes). *delta receives the
+ * stack pointer after the call minus the stack pointer before the first
+ * push: 0 when the callee removed exactly its arguments. The caller's stack
+ * pointer is restored whatever the callee did, so a wrong callee is counted,
+ * not fatal. Assembled as ELF on Linux and as COFF, where C names carry a
+ * leading underscore, on Windows.
  */
+#if defined(_WIN32)
+#define STDCALL_CALL _sorvel_testhost_stdcall_call
+#else
+#define STDCALL_CALL sorvel_testhost_stdcall_call
+#endif
         .text
-        .globl  sorvel_testhost_stdcall_call
-        .type   sorvel_testhost_stdcall_call, @function
-sorvel_testhost_stdcall_call:
+        .globl  STDCALL_CALL
+#if !defined(_WIN32)
+        .type   STDCALL_CALL, @function
+#endif
+STDCALL_CALL:
         pushl   %ebp
         movl    %esp, %ebp
         pushl   %ebx
@@ -44,5 +53,7 @@ sorvel_testhost_stdcall_call:
         popl    %ebx
         popl    %ebp
         ret
-        .size   sorvel_testhost_stdcall_call, .-sorvel_testhost_stdcall_call
+#if !defined(_WIN32)
+        .size   STDCALL_CALL, .-STDCALL_CALL
         .section .note.GNU-stack,"",@progbits
+#endif

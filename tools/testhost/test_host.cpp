@@ -3,6 +3,7 @@
 
 #include <algorithm>
 #include <bit>
+#include <cctype>
 #include <cmath>
 #include <cstdlib>
 #include <cstring>
@@ -10,6 +11,7 @@
 #include <iterator>
 #include <limits>
 #include <stdexcept>
+#include <utility>
 
 #include "host/catalogue.hpp"
 #include "host/platform.hpp"
@@ -29,13 +31,7 @@
 #include <unistd.h>
 #endif
 
-#if defined(__i386__) && !defined(_WIN32)
-#include "pe_image.hpp"
-// Host routines use the library's calling convention: stdcall on 32-bit x86,
-// where the callee removes its arguments. A Windows DLL calls them with the
-// stack aligned to 4 bytes only, so they realign it.
-#define TESTHOST_CALL __attribute__((stdcall, force_align_arg_pointer))
-#define TESTHOST_MAPS_DLLS 1
+#if defined(__i386__)
 // stdcall_check_i386.S: calls fn with count words pushed right to left and
 // stores in *delta how far the stack pointer moved across the call (0 when
 // the callee removed exactly its arguments). The stack is restored either way.
@@ -43,8 +39,6 @@ extern "C" sorvel::testhost::word sorvel_testhost_stdcall_call(void* fn, const s
                                                                sorvel::testhost::word count,
                                                                sorvel::testhost::word* delta);
 #define TESTHOST_CHECKED_CALLS 1
-#else
-#define TESTHOST_CALL SORVEL_CALL
 #endif
 
 namespace sorvel::testhost {
@@ -52,6 +46,7 @@ namespace {
 
 std::size_t g_stack_errors = 0;
 Host* g_active = nullptr;
+const Library::Counter* g_counter = nullptr;
 
 template <class T>
 T read_at(const unsigned char* bytes, std::size_t offset) {
@@ -90,45 +85,85 @@ word float_word(float value) {
 
 // ---------------------------------------------------------------- Library
 
-std::shared_ptr<Library> Library::load(const std::string& path) {
-    std::shared_ptr<Library> library(new Library());
-#if !defined(_WIN32)
-    std::ifstream in(path, std::ios::binary);
-    char signature[2] = {};
-    if (in.read(signature, 2) && signature[0] == 'M' && signature[1] == 'Z') {
-#if defined(TESTHOST_MAPS_DLLS)
-        in.seekg(0);
-        std::vector<unsigned char> file{std::istreambuf_iterator<char>(in), std::istreambuf_iterator<char>()};
-        library->image_ = std::make_shared<PeImage>(path, std::move(file));
-        library->handle_ = reinterpret_cast<void*>(library->image_->base());
-        library->loader_owned_ = true;
-        library->allocations_ = &runtime::allocations();
-        if (library->symbol("GetRunObjectInfos") == nullptr) {
-            throw std::runtime_error(path + " exports no GetRunObjectInfos");
-        }
-        return library;
-#else
-        throw std::runtime_error("cannot load " + path +
-                                 ": a Windows DLL runs only in the 32-bit x86 Linux test host (the i386 build)");
-#endif
-    }
-#endif
+void Library::use_counter(const Counter* counter) {
+    g_counter = counter;
+}
+
+const Library::Counter* Library::counter() {
+    return g_counter;
+}
+
 #if defined(_WIN32)
+namespace {
+// The base and size a DLL's headers ask for.
+std::pair<std::uintptr_t, std::size_t> preferred_range(const std::string& path) {
+    std::ifstream in(path, std::ios::binary);
+    IMAGE_DOS_HEADER dos{};
+    IMAGE_NT_HEADERS nt{};
+    if (!in.read(reinterpret_cast<char*>(&dos), sizeof dos) || dos.e_magic != IMAGE_DOS_SIGNATURE ||
+        !in.seekg(dos.e_lfanew) || !in.read(reinterpret_cast<char*>(&nt), sizeof nt) ||
+        nt.Signature != IMAGE_NT_SIGNATURE) {
+        throw std::runtime_error("cannot load " + path + ": no PE headers");
+    }
+    return {static_cast<std::uintptr_t>(nt.OptionalHeader.ImageBase), nt.OptionalHeader.SizeOfImage};
+}
+
+std::string system_message(DWORD error, const std::string& path) {
+    char text[256] = {};
+    const DWORD n = FormatMessageA(FORMAT_MESSAGE_FROM_SYSTEM | FORMAT_MESSAGE_IGNORE_INSERTS, nullptr, error, 0, text,
+                                   sizeof text, nullptr);
+    std::string message(text, n);
+    while (!message.empty() && std::isspace(static_cast<unsigned char>(message.back())) != 0) {
+        message.pop_back();
+    }
+    if (const auto insert = message.find("%1"); insert != std::string::npos) {
+        message.replace(insert, 2, path);
+    }
+    return "error " + std::to_string(error) + (message.empty() ? "" : " (" + message + ")");
+}
+}  // namespace
+#endif
+
+std::shared_ptr<Library> Library::load(const std::string& path, Placement placement) {
+    std::shared_ptr<Library> library(new Library());
+#if defined(_WIN32)
+    std::uintptr_t preferred = 0;
+    if (placement == Placement::away_from_preferred_base) {
+        // Holding the preferred range leaves the loader one way: elsewhere,
+        // with every relocation applied.
+        const auto [base, size] = preferred_range(path);
+        preferred = base;
+        library->reserved_ = VirtualAlloc(reinterpret_cast<void*>(base), size, MEM_RESERVE, PAGE_NOACCESS);
+    }
     HMODULE module = LoadLibraryA(path.c_str());
     if (module == nullptr) {
-        throw std::runtime_error("cannot load " + path + ": error " + std::to_string(GetLastError()));
+        throw std::runtime_error("cannot load " + path + ": " + system_message(GetLastError(), path));
     }
     library->handle_ = reinterpret_cast<void*>(module);
     library->loader_owned_ = true;
+    library->owned_ = true;
+    if (preferred != 0 && reinterpret_cast<std::uintptr_t>(module) == preferred) {
+        throw std::runtime_error(path + " was loaded at its preferred base, which was to be taken");
+    }
+    if (g_counter != nullptr && g_counter->reroute(module)) {
+        library->allocations_ = &g_counter->allocations;
+    }
 #else
+    std::ifstream in(path, std::ios::binary);
+    char signature[2] = {};
+    if (in.read(signature, 2) && signature[0] == 'M' && signature[1] == 'Z') {
+        throw std::runtime_error("cannot load " + path +
+                                 ": a Windows DLL; the Windows build of this program loads it, under wine");
+    }
+    (void)placement;
     void* handle = dlopen(path.c_str(), RTLD_NOW | RTLD_GLOBAL);
     if (handle == nullptr) {
         const char* error = dlerror();
         throw std::runtime_error("cannot load " + path + ": " + (error != nullptr ? error : "unknown error"));
     }
     library->handle_ = handle;
-#endif
     library->owned_ = true;
+#endif
     if (library->symbol("GetRunObjectInfos") == nullptr) {
         throw std::runtime_error(path + " exports no GetRunObjectInfos");
     }
@@ -151,22 +186,21 @@ std::shared_ptr<Library> Library::built() {
 }
 
 Library::~Library() {
-    if (!owned_ || handle_ == nullptr) {
-        return;
+    if (owned_ && handle_ != nullptr) {
+#if defined(_WIN32)
+        FreeLibrary(reinterpret_cast<HMODULE>(handle_));
+#else
+        dlclose(handle_);
+#endif
     }
 #if defined(_WIN32)
-    FreeLibrary(reinterpret_cast<HMODULE>(handle_));
-#else
-    dlclose(handle_);
+    if (reserved_ != nullptr) {
+        VirtualFree(reserved_, 0, MEM_RELEASE);
+    }
 #endif
 }
 
 void* Library::symbol(const char* name) const {
-#if defined(TESTHOST_MAPS_DLLS)
-    if (image_) {
-        return image_->symbol(name);
-    }
-#endif
     if (!symbols_.empty()) {
         for (const Symbol& s : symbols_) {
             if (std::strcmp(s.name, name) == 0) {
@@ -186,11 +220,6 @@ void* Library::symbol(const char* name) const {
 }
 
 void* Library::symbol_by_ordinal(int ordinal) const {
-#if defined(TESTHOST_MAPS_DLLS)
-    if (image_) {
-        return image_->symbol_by_ordinal(ordinal);
-    }
-#endif
 #if defined(_WIN32)
     if (handle_ == nullptr || ordinal <= 0 || ordinal > 0xFFFF) {
         return nullptr;
@@ -208,21 +237,10 @@ word Library::module_handle() const {
 }
 
 void Library::seed_rand(unsigned seed) const {
-#if defined(TESTHOST_MAPS_DLLS)
-    if (image_) {
-        runtime::generator() = seed;
-        return;
-    }
-#endif
     std::srand(seed);
 }
 
 void* Library::entry_point() const {
-#if defined(TESTHOST_MAPS_DLLS)
-    if (image_) {
-        return image_->entry_point();
-    }
-#endif
 #if defined(_WIN32)
     if (loader_owned_) {
         // The module's entry point from its PE headers: the runtime library's
@@ -256,19 +274,19 @@ word Library::call(void* function, std::initializer_list<word> args) const {
 #else
     const word* a = args.begin();
     switch (args.size()) {
-        case 0: return reinterpret_cast<word(TESTHOST_CALL*)()>(function)();
-        case 1: return reinterpret_cast<word(TESTHOST_CALL*)(word)>(function)(a[0]);
-        case 2: return reinterpret_cast<word(TESTHOST_CALL*)(word, word)>(function)(a[0], a[1]);
-        case 3: return reinterpret_cast<word(TESTHOST_CALL*)(word, word, word)>(function)(a[0], a[1], a[2]);
-        case 4: return reinterpret_cast<word(TESTHOST_CALL*)(word, word, word, word)>(function)(a[0], a[1], a[2], a[3]);
+        case 0: return reinterpret_cast<word(SORVEL_CALL*)()>(function)();
+        case 1: return reinterpret_cast<word(SORVEL_CALL*)(word)>(function)(a[0]);
+        case 2: return reinterpret_cast<word(SORVEL_CALL*)(word, word)>(function)(a[0], a[1]);
+        case 3: return reinterpret_cast<word(SORVEL_CALL*)(word, word, word)>(function)(a[0], a[1], a[2]);
+        case 4: return reinterpret_cast<word(SORVEL_CALL*)(word, word, word, word)>(function)(a[0], a[1], a[2], a[3]);
         case 5:
-            return reinterpret_cast<word(TESTHOST_CALL*)(word, word, word, word, word)>(function)(a[0], a[1], a[2],
-                                                                                                  a[3], a[4]);
+            return reinterpret_cast<word(SORVEL_CALL*)(word, word, word, word, word)>(function)(a[0], a[1], a[2], a[3],
+                                                                                                a[4]);
         case 6:
-            return reinterpret_cast<word(TESTHOST_CALL*)(word, word, word, word, word, word)>(function)(
-                a[0], a[1], a[2], a[3], a[4], a[5]);
+            return reinterpret_cast<word(SORVEL_CALL*)(word, word, word, word, word, word)>(function)(a[0], a[1], a[2],
+                                                                                                      a[3], a[4], a[5]);
         default:
-            return reinterpret_cast<word(TESTHOST_CALL*)(word, word, word, word, word, word, word)>(function)(
+            return reinterpret_cast<word(SORVEL_CALL*)(word, word, word, word, word, word, word)>(function)(
                 a[0], a[1], a[2], a[3], a[4], a[5], a[6]);
     }
 #endif
@@ -481,23 +499,23 @@ struct Routines {
     }
 
     // Selectors: 0 integer, 2 float, -1 string.
-    static word TESTHOST_CALL read_event_param(word record_word, word selector, word zero) {
+    static word SORVEL_CALL read_event_param(word record_word, word selector, word zero) {
         const word form = selector == -1 ? 1 : selector == 2 ? 2 : 0;
         const word result = serve(form);
         return record(HostCall::Routine::read_event_param, {record_word, selector, zero}, result);
     }
 
-    static word TESTHOST_CALL read_first_expr_param(word record_word, word type, word param) {
+    static word SORVEL_CALL read_first_expr_param(word record_word, word type, word param) {
         const word result = serve(type);
         return record(HostCall::Routine::read_first_expr_param, {record_word, type, param}, result);
     }
 
-    static word TESTHOST_CALL read_next_expr_param(word record_word, word type, word param) {
+    static word SORVEL_CALL read_next_expr_param(word record_word, word type, word param) {
         const word result = serve(type);
         return record(HostCall::Routine::read_next_expr_param, {record_word, type, param}, result);
     }
 
-    static word TESTHOST_CALL alloc_result_string(word record_word, word zero, word size) {
+    static word SORVEL_CALL alloc_result_string(word record_word, word zero, word size) {
         Host& h = host();
         word result = 0;
         if (!h.no_buffer_) {
@@ -508,7 +526,7 @@ struct Routines {
         return record(HostCall::Routine::alloc_result_string, {record_word, zero, size}, result);
     }
 
-    static word TESTHOST_CALL open_file(word name_word, word size_word, word zero) {
+    static word SORVEL_CALL open_file(word name_word, word size_word, word zero) {
         Host& h = host();
         const auto* name = reinterpret_cast<const char*>(name_word);
         word handle = -1;
@@ -549,7 +567,7 @@ struct Routines {
         return record(HostCall::Routine::open_file, {name_word, size_word, zero}, handle);
     }
 
-    static word TESTHOST_CALL close_file(word handle) {
+    static word SORVEL_CALL close_file(word handle) {
         Host& h = host();
         if (h.open_files_.erase(handle) == 1) {
             ++h.closes_;

@@ -70,15 +70,15 @@ struct RecordLayout {
     static constexpr std::size_t kCloseFile = 81;
 };
 
-class PeImage;
-
 // The loaded library and its exports.
 class Library {
 public:
-    // Loads by path: dlopen, or LoadLibrary on Windows. A Windows DLL ("MZ")
-    // is mapped by the test host itself on 32-bit x86 Linux (PeImage). Throws
+    // Where a Windows DLL goes: where its headers ask, or anywhere else, so
+    // that the loader has to apply its relocations.
+    enum class Placement { preferred, away_from_preferred_base };
+    // Loads by path: dlopen, or LoadLibrary on Windows. Throws
     // std::runtime_error when the library or an export cannot be found.
-    static std::shared_ptr<Library> load(const std::string& path);
+    static std::shared_ptr<Library> load(const std::string& path, Placement placement = Placement::preferred);
     // The library linked into this program (tests that need its allocator).
     static std::shared_ptr<Library> linked_in();
     // The library named by SORVEL_TEST_LIBRARY, else the one built next to
@@ -92,8 +92,7 @@ public:
     void* symbol(const char* name) const;        // null when absent
     void* symbol_by_ordinal(int ordinal) const;  // Windows DLLs only; null elsewhere
     word module_handle() const;
-    // Seeds the C runtime generator the library draws from: the host's own
-    // msvcrt one for a mapped image, the system's otherwise.
+    // Seeds the C runtime generator that the library shares with this program.
     void seed_rand(unsigned seed) const;
 
     // What the loader calls: DllMain itself where the test host plays the
@@ -103,23 +102,34 @@ public:
     bool loader_owned() const { return loader_owned_; }
 
     // Calls a function of the library with the given words. On 32-bit x86
-    // ELF the call checks that the callee removed exactly its arguments
+    // the call checks that the callee removed exactly its arguments
     // (stdcall); every mismatch is counted in stack_errors().
     word call(void* function, std::initializer_list<word> args) const;
     word call_export(const char* name, std::initializer_list<word> args) const;
+    static constexpr bool kChecksStack = sizeof(void*) == 4;
     static std::size_t stack_errors();
     // For the test that proves the check itself catches a wrong callee.
     static void reset_stack_errors();
 
-    // The library's allocations where the host can reach them: its own
-    // counter when it is linked in, the host's C runtime for an image the
-    // host mapped itself. Null for a library the system loader loaded.
+    // The library's allocations where the host can reach them: the test
+    // program's counting allocator stands behind the allocation seam of the
+    // library linked in, and behind a Windows DLL's C runtime allocator
+    // imports. Null where the program has no counter (sorvel-host, the
+    // benchmarks) and for a shared object that dlopen loaded.
     struct Allocations {
         std::size_t (*live)();
         void (*fail_after)(long n);  // the n-th allocation from now fails; negative: none
         std::uint64_t (*total)();    // allocations made so far
     };
     const Allocations* allocations() const { return allocations_; }
+    // A test program's counter announces itself as the program starts.
+    // `reroute` points a loaded module's allocator imports at it and gives
+    // whether it found any.
+    struct Counter {
+        Allocations allocations;
+        bool (*reroute)(void* module);
+    };
+    static void use_counter(const Counter* counter);
 
 private:
     struct Symbol {
@@ -127,12 +137,13 @@ private:
         void* address;
     };
     Library() = default;
+    static const Counter* counter();
     void* handle_ = nullptr;
     bool owned_ = false;
     bool loader_owned_ = false;
     const Allocations* allocations_ = nullptr;
-    std::vector<Symbol> symbols_;     // linked in: the program's own table
-    std::shared_ptr<PeImage> image_;  // a DLL the test host mapped itself
+    std::vector<Symbol> symbols_;  // linked in: the program's own table
+    void* reserved_ = nullptr;     // the preferred base, kept from a DLL loaded away from it
 };
 
 // A parameter value the host gives for the next parameter request.
