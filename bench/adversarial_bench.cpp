@@ -24,7 +24,7 @@
 namespace {
 
 using namespace sorvel;
-using bench::Fields;
+using test::Holder;
 
 enum class Op : std::uint8_t { Add, Remove, Contains, IndexOf, ElementAt, Clear };
 
@@ -179,7 +179,7 @@ void fail_allocation_after(long n) {
 // The last Add of a script that allocates more than its node (a growth of
 // the side structure) and how many blocks it allocates; -1 when none does.
 std::pair<std::ptrdiff_t, long> last_growth(const Script& adds) {
-    Fields<std::int32_t> f(false, true);
+    Holder<std::int32_t> f(false, true);
     IntegerCollection c = f.view();
     std::pair<std::ptrdiff_t, long> found{-1, 0};
     for (std::size_t i = 0; i < adds.steps.size(); ++i) {
@@ -202,7 +202,7 @@ void run(benchmark::State& state, const Case& family, std::int64_t fresh) {
     for (auto _ : state) {
         for (int r = 0; r < rounds; ++r) {
             state.PauseTiming();
-            auto* f = new Fields<std::int32_t>(k.index, true);
+            auto* f = new Holder<std::int32_t>(k.index, true);
             IntegerCollection c = f->view();
             const Step* steps = k.setup.steps.data();
             if (failing >= 0) {
@@ -210,7 +210,7 @@ void run(benchmark::State& state, const Case& family, std::int64_t fresh) {
                 fail_allocation_after(k.fail_after);
                 play(c, steps + failing, steps + failing + 1);
                 fail_allocation_after(-1);
-                if (f->links.built()) {
+                if (f->side.built()) {
                     state.SkipWithError("the failure did not reach the side structure");
                 }
             }
@@ -522,7 +522,7 @@ void BM_Adv_IndexOfAgainstContains(benchmark::State& state) {
         index_of.query(Op::IndexOf, v);
         contains.query(Op::Contains, v);
     }
-    Fields<std::int32_t> f(true, true);
+    Holder<std::int32_t> f(true, true);
     play(f.view(), k.setup);
     constexpr std::size_t kBatch = 1'000;
     double seconds[2] = {};
@@ -606,7 +606,7 @@ void BM_Adv_Memory(benchmark::State& state) {
         double per_value[2] = {};
         for (int which = 0; which < 2; ++which) {
             const std::size_t before = bench::heap_in_use();
-            auto* f = new Fields<std::int32_t>(with_index, true);
+            auto* f = new Holder<std::int32_t>(with_index, true);
             play(f->view(), which == 0 ? script : fresh);
             per_value[which] = static_cast<double>(bench::heap_in_use() - before) / static_cast<double>(f->count);
             if (static_cast<std::size_t>(f->count) != fresh.count) {

@@ -1,4 +1,4 @@
-// A collection's fields, owned by a benchmark as a run record owns them.
+// What the benchmarks share: random values and the heap in use.
 #pragma once
 
 #include <benchmark/benchmark.h>
@@ -12,31 +12,9 @@
 #endif
 
 #include "collections/collections.hpp"
+#include "holder.hpp"
 
 namespace sorvel::bench {
-
-template <class V>
-struct Fields {
-    TreeNode<V>* root = nullptr;
-    std::int32_t count = 0;
-    InsertionIndex<TreeNode<V>>* index = nullptr;
-    LinkIndex<TreeNode<V>> links;
-    bool with_links = false;  // false: plain descents, as before the side structure
-
-    explicit Fields(bool with_index = false, bool linked = false) : with_links(linked) {
-        if (with_index) {
-            index = create_index<TreeNode<V>>();
-        }
-    }
-    Fields(const Fields&) = delete;
-    Fields& operator=(const Fields&) = delete;
-    ~Fields() {
-        Collection<V> c = view();
-        clear(c);
-        destroy_index(index);
-    }
-    Collection<V> view() { return Collection<V>{root, count, index, with_links ? &links : nullptr}; }
-};
 
 // Random 32-bit values (repeats possible), the same for the same seed.
 inline std::vector<std::int32_t> random_ints(std::size_t n, std::uint32_t seed = 11) {

@@ -57,16 +57,16 @@ std::vector<T> shuffled(const std::vector<T>& values, std::uint32_t seed) {
     return out;
 }
 
-using bench::Fields;
+using test::Holder;
 
-void fill(Fields<std::int32_t>& f, const std::vector<std::int32_t>& values) {
+void fill(Holder<std::int32_t>& f, const std::vector<std::int32_t>& values) {
     IntegerCollection c = f.view();
     for (const std::int32_t v : values) {
         add(c, v);
     }
 }
 
-void fill(Fields<char*>& f, const std::vector<std::string>& values, bool case_sensitive) {
+void fill(Holder<char*>& f, const std::vector<std::string>& values, bool case_sensitive) {
     StringCollection c = f.view();
     for (const std::string& s : values) {
         AddStringValue(c, s.c_str(), case_sensitive);
@@ -79,7 +79,7 @@ void BM_Add_Integers_Sorvel(benchmark::State& state) {
     const auto& values = random_integers();
     const bool with_index = state.range(0) != 0;
     for (auto _ : state) {
-        Fields<std::int32_t> f(with_index);
+        Holder<std::int32_t> f(with_index, false);
         fill(f, values);
         benchmark::DoNotOptimize(f.count);
         state.PauseTiming();
@@ -113,7 +113,7 @@ void BM_Add_Strings_Sorvel(benchmark::State& state) {
     const auto& values = random_strings();
     const bool case_sensitive = state.range(0) != 0;
     for (auto _ : state) {
-        Fields<char*> f(false);
+        Holder<char*> f(false, false);
         fill(f, values, case_sensitive);
         benchmark::DoNotOptimize(f.count);
         state.PauseTiming();
@@ -181,7 +181,7 @@ const std::vector<std::string>& string_probes() {
 }
 
 void BM_Contains_Integers_Sorvel(benchmark::State& state) {
-    Fields<std::int32_t> f;
+    Holder<std::int32_t> f(false, false);
     fill(f, random_integers());
     const IntegerCollection c = f.view();
     const auto& probes = integer_probes();
@@ -206,7 +206,7 @@ BENCHMARK(BM_Contains_Integers_StdSet)->Unit(benchmark::kMillisecond);
 
 void BM_Contains_Strings_Sorvel(benchmark::State& state) {
     const bool case_sensitive = state.range(0) != 0;
-    Fields<char*> f;
+    Holder<char*> f(false, false);
     fill(f, random_strings(), case_sensitive);
     const StringCollection c = f.view();
     const auto& probes = string_probes();
@@ -387,10 +387,10 @@ const RemovalRun& removal_run(std::size_t size) {
 // removal is bound by cache misses along the path, and placement would
 // otherwise weigh more than the removal steps themselves.
 struct BothTrees {
-    Fields<std::int32_t> library;
+    Holder<std::int32_t> library;
     LiteralIntegerTree literal;
 
-    BothTrees(const std::vector<std::int32_t>& adds, bool with_index) : library(with_index) {
+    BothTrees(const std::vector<std::int32_t>& adds, bool with_index) : library(with_index, false) {
         IntegerCollection c = library.view();
         for (const std::int32_t v : adds) {
             add(c, v);
@@ -521,7 +521,7 @@ void BM_Memory_Integers_Sorvel(benchmark::State& state) {
     const bool with_index = state.range(0) != 0;
     for (auto _ : state) {
         const std::size_t heap = bench::heap_in_use();
-        Fields<std::int32_t> f(with_index);
+        Holder<std::int32_t> f(with_index, false);
         fill(f, random_integers());
         report_memory(state, bench::heap_in_use() - heap, 0, static_cast<std::size_t>(f.count));
     }
@@ -545,7 +545,7 @@ void BM_Memory_Strings_Sorvel(benchmark::State& state) {
     const bool with_index = state.range(0) != 0;
     for (auto _ : state) {
         const std::size_t heap = bench::heap_in_use();
-        Fields<char*> f(with_index);
+        Holder<char*> f(with_index, false);
         fill(f, random_strings(), true);
         report_memory(state, bench::heap_in_use() - heap, 0, static_cast<std::size_t>(f.count));
     }

@@ -80,7 +80,7 @@ struct ScriptedDraws {
 };
 
 // Without an index, with the side structure, as a collection of the product.
-using Strings = sorvel::bench::Fields<char*>;
+using Strings = sorvel::test::Holder<char*>;
 
 std::size_t count_lines(const std::string& file) {
     std::size_t lines = 0;

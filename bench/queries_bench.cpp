@@ -20,7 +20,7 @@ using namespace sorvel;
 constexpr std::size_t kValues = 100'000;
 constexpr std::int32_t kChain = 20'000;
 
-using bench::Fields;
+using test::Holder;
 
 struct Data {
     std::vector<std::int32_t> integers;
@@ -50,8 +50,8 @@ const Data& data() {
     return d;
 }
 
-Fields<std::int32_t>& integer_collection() {
-    static Fields<std::int32_t> f(true);
+Holder<std::int32_t>& integer_collection() {
+    static Holder<std::int32_t> f(true, false);
     if (f.count == 0) {
         IntegerCollection c = f.view();
         for (const std::int32_t v : data().integers) {
@@ -61,8 +61,8 @@ Fields<std::int32_t>& integer_collection() {
     return f;
 }
 
-Fields<char*>& string_collection() {
-    static Fields<char*> f(true);
+Holder<char*>& string_collection() {
+    static Holder<char*> f(true, false);
     if (f.count == 0) {
         StringCollection c = f.view();
         for (const std::string& s : data().strings) {
@@ -211,7 +211,7 @@ BENCHMARK(BM_RandomElement_Strings_RandomTree);
 // Ascending adds make a chain of right links; about half of the walks stop
 // at once, the rest go a geometric distance down.
 void BM_RandomElement_Integers_Chain(benchmark::State& state) {
-    Fields<std::int32_t> f(false);
+    Holder<std::int32_t> f(false, false);
     IntegerCollection c = f.view();
     for (std::int32_t v = 0; v < kChain; ++v) {
         add(c, v);
@@ -226,7 +226,7 @@ BENCHMARK(BM_RandomElement_Integers_Chain);
 
 // The worst case on the same chain: every draw follows the chain to its end.
 void BM_RandomElement_Integers_ChainWalkedToTheEnd(benchmark::State& state) {
-    Fields<std::int32_t> f(false);
+    Holder<std::int32_t> f(false, false);
     IntegerCollection c = f.view();
     for (std::int32_t v = 0; v < kChain; ++v) {
         add(c, v);

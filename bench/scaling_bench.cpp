@@ -17,8 +17,8 @@
 namespace {
 
 using namespace sorvel;
-using bench::Fields;
 using bench::random_ints;
+using test::Holder;
 
 struct Lcg {
     std::uint32_t state = 12345;
@@ -31,11 +31,11 @@ struct Lcg {
 };
 
 // One random tree per size, with its index, kept for the read-only queries.
-Fields<std::int32_t>& random_tree(std::size_t n) {
-    static std::map<std::size_t, std::unique_ptr<Fields<std::int32_t>>> trees;
+Holder<std::int32_t>& random_tree(std::size_t n) {
+    static std::map<std::size_t, std::unique_ptr<Holder<std::int32_t>>> trees;
     auto& f = trees[n];
     if (!f) {
-        f = std::make_unique<Fields<std::int32_t>>(true);
+        f = std::make_unique<Holder<std::int32_t>>(true, false);
         IntegerCollection c = f->view();
         for (const std::int32_t v : random_ints(n, 7)) {
             add(c, v);
@@ -53,7 +53,7 @@ void sizes(benchmark::internal::Benchmark* b) {
 void BM_Scale_Add(benchmark::State& state) {
     const auto values = random_ints(static_cast<std::size_t>(state.range(0)), 7);
     for (auto _ : state) {
-        Fields<std::int32_t> f(false);
+        Holder<std::int32_t> f(false, false);
         IntegerCollection c = f.view();
         for (const std::int32_t v : values) {
             add(c, v);
@@ -67,7 +67,7 @@ void BM_Scale_Add(benchmark::State& state) {
 BENCHMARK(BM_Scale_Add)->Apply(sizes)->Unit(benchmark::kMicrosecond);
 
 void BM_Scale_Contains(benchmark::State& state) {
-    Fields<std::int32_t>& f = random_tree(static_cast<std::size_t>(state.range(0)));
+    Holder<std::int32_t>& f = random_tree(static_cast<std::size_t>(state.range(0)));
     const auto probes = random_ints(static_cast<std::size_t>(state.range(0)), 7);  // every held value
     std::size_t i = 0;
     for (auto _ : state) {
@@ -77,7 +77,7 @@ void BM_Scale_Contains(benchmark::State& state) {
 BENCHMARK(BM_Scale_Contains)->Apply(sizes);
 
 void BM_Scale_IndexOf(benchmark::State& state) {
-    Fields<std::int32_t>& f = random_tree(static_cast<std::size_t>(state.range(0)));
+    Holder<std::int32_t>& f = random_tree(static_cast<std::size_t>(state.range(0)));
     const auto probes = random_ints(static_cast<std::size_t>(state.range(0)), 7);
     std::size_t i = 0;
     for (auto _ : state) {
@@ -87,7 +87,7 @@ void BM_Scale_IndexOf(benchmark::State& state) {
 BENCHMARK(BM_Scale_IndexOf)->Apply(sizes);
 
 void BM_Scale_RandomElement(benchmark::State& state) {
-    Fields<std::int32_t>& f = random_tree(static_cast<std::size_t>(state.range(0)));
+    Holder<std::int32_t>& f = random_tree(static_cast<std::size_t>(state.range(0)));
     Lcg draws;
     for (auto _ : state) {
         benchmark::DoNotOptimize(random_path_pick(static_cast<const IntegerNode*>(f.root), draws.source()));
@@ -103,7 +103,7 @@ void BM_Scale_Remove(benchmark::State& state) {
     const std::size_t removals = std::min<std::size_t>(n / 10, 10'000);
     for (auto _ : state) {
         state.PauseTiming();
-        Fields<std::int32_t> f(with_index);
+        Holder<std::int32_t> f(with_index, false);
         IntegerCollection c = f.view();
         for (const std::int32_t v : values) {
             add(c, v);
@@ -162,7 +162,7 @@ BENCHMARK(BM_Chain_Interface_RandomElement)->Arg(1'000)->Arg(5'000)->Arg(20'000)
 // ---- Deeper chains, linked directly at the deepest node ----------------------
 
 struct Chain {
-    Fields<std::int32_t> fields{false};
+    Holder<std::int32_t> fields{false, false};
     explicit Chain(std::int32_t n) {
         IntegerNode** link = &fields.root;
         for (std::int32_t v = 0; v < n; ++v) {

@@ -17,8 +17,8 @@
 namespace {
 
 using namespace sorvel;
-using bench::Fields;
 using bench::random_ints;
+using test::Holder;
 
 // Letters of both cases, digits and "_[]": case folding matters for them.
 std::vector<std::string> random_strings(std::size_t n) {
@@ -64,7 +64,7 @@ void add_all(benchmark::State& state, const std::vector<T>& random_order, bool l
         std::sort(values.begin(), values.end());
     }
     for (auto _ : state) {
-        auto* f = new Fields<std::conditional_t<std::is_same_v<T, std::string>, char*, T>>(false, linked);
+        auto* f = new Holder<std::conditional_t<std::is_same_v<T, std::string>, char*, T>>(false, linked);
         auto c = f->view();
         for (const T& v : values) {
             put(c, v, true);
@@ -103,7 +103,7 @@ void BM_Deep_ContainsAfterRemovingOldest(benchmark::State& state) {
     const auto n = static_cast<std::size_t>(state.range(0));
     const std::vector<std::int32_t> values = random_ints(n);
     const std::size_t gone = n * static_cast<std::size_t>(state.range(1)) / 100;
-    Fields<std::int32_t> f(false, true);
+    Holder<std::int32_t> f(false, true);
     IntegerCollection c = f.view();
     for (std::size_t i = state.range(2) != 0 ? gone : 0; i < n; ++i) {
         add(c, values[i]);
@@ -134,7 +134,7 @@ void remove_from_full(benchmark::State& state, std::size_t n, std::size_t remova
         state.PauseTiming();
         // Made and freed outside the timing: freeing the index after a
         // million nodes makes the allocator consolidate the whole heap.
-        auto* f = new Fields<std::int32_t>(with_index, linked);
+        auto* f = new Holder<std::int32_t>(with_index, linked);
         IntegerCollection c = f->view();
         for (const std::int32_t v : values) {
             add(c, v);
@@ -204,7 +204,7 @@ void random_input(benchmark::State& state, const std::vector<T>& values, bool se
             set_add_or_find<std::set<T>>(state, values, find);
         }
     } else {
-        Fields<std::conditional_t<std::is_same_v<T, std::string>, char*, T>> f(false, state.range(2) == 1);
+        Holder<std::conditional_t<std::is_same_v<T, std::string>, char*, T>> f(false, state.range(2) == 1);
         auto c = f.view();
         for (const T& v : values) {
             if (find) {
@@ -245,11 +245,11 @@ BENCHMARK(BM_Random)
 // Positions in 1,000,000 random values, after removing 100,000 of them at
 // random (gaps 1) or none (gaps 0): walking positions 0, 1, 2, ... (walk 1)
 // or at random (walk 0), and IndexOf.
-Fields<std::int32_t>& index_fixture(bool gaps) {
-    static Fields<std::int32_t>* made[2] = {};
-    Fields<std::int32_t>*& f = made[gaps ? 1 : 0];
+Holder<std::int32_t>& index_fixture(bool gaps) {
+    static Holder<std::int32_t>* made[2] = {};
+    Holder<std::int32_t>*& f = made[gaps ? 1 : 0];
     if (f == nullptr) {
-        f = new Fields<std::int32_t>(true, true);
+        f = new Holder<std::int32_t>(true, true);
         IntegerCollection c = f->view();
         std::vector<std::int32_t> values = random_ints(1'000'000);
         for (const std::int32_t v : values) {
@@ -302,7 +302,7 @@ void BM_Deep_Memory(benchmark::State& state) {
     for (auto _ : state) {
 #if defined(__GLIBC__)
         const std::size_t before = bench::heap_in_use();
-        Fields<std::int32_t> f(state.range(1) != 0, state.range(2) != 0);
+        Holder<std::int32_t> f(state.range(1) != 0, state.range(2) != 0);
         IntegerCollection c = f.view();
         for (const std::int32_t v : values) {
             add(c, v);

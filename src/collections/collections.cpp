@@ -26,10 +26,10 @@ std::uint32_t descent_bound(std::int32_t count) noexcept {
 // With the side structure, also what its search found.
 template <class Node>
 struct Place {
-    static constexpr std::uint32_t kNone = LinkIndex<Node>::kNone;
+    static constexpr std::uint32_t kNone = SideStructure<Node>::kNone;
     Node** link;
     bool held;
-    typename LinkIndex<Node>::Found found = {};  // found.match: the key's entry, or none
+    typename SideStructure<Node>::Found found = {};  // found.match: the key's entry, or none
 };
 
 enum class Search : bool { value, leaf };
@@ -37,30 +37,30 @@ enum class Search : bool { value, leaf };
 template <class V, class Key, class Order>
 Place<TreeNode<V>> locate(const Collection<V>& c, const Key& key, const Order& order, Search search) noexcept {
     using Node = TreeNode<V>;
-    LinkIndex<Node>* links = c.links;
-    if (links != nullptr && links->built()) {
-        const auto f = links->find(key, order);
-        if (f.match != links->kNone) {
-            return {links->link(f.match), true, f};
+    SideStructure<Node>* side = c.side;
+    if (side != nullptr && side->built()) {
+        const auto f = side->find(key, order);
+        if (f.match != side->kNone) {
+            return {side->link(f.match), true, f};
         }
         if (search == Search::value) {
             return {nullptr, false};
         }
         // A new leaf hangs from its predecessor's right link or, when that is
         // taken, from its successor's left link.
-        Node* below = f.below == links->kNone ? nullptr : *links->link(f.below);
+        Node* below = f.below == side->kNone ? nullptr : *side->link(f.below);
         if (below != nullptr && below->right == nullptr) {
             return {&below->right, false};
         }
-        return {f.above == links->kNone ? &c.root : &(*links->link(f.above))->left, false};
+        return {f.above == side->kNone ? &c.root : &(*side->link(f.above))->left, false};
     }
     std::uint32_t depth = 0;
     Node** link = TreeSteps<Node>::descend(c.root, key, order, depth);
-    if (depth > descent_bound(c.count) && links != nullptr && links->may_build(depth)) {
-        if (links->build(c.root, c.count)) {
+    if (depth > descent_bound(c.count) && side != nullptr && side->may_build(depth)) {
+        if (side->build(c.root, c.count)) {
             return locate(c, key, order, search);
         }
-        links->give_up(c.count);
+        side->give_up(c.count);
     }
     return {link, *link != nullptr};
 }
@@ -96,8 +96,8 @@ bool add_key(Collection<V>& c, const Key& key, const Order& order, Make&& make) 
         c.index->append(node);
     }
     ++c.count;
-    if (c.links != nullptr && c.links->built() && !c.links->insert(link, order)) {
-        c.links->give_up(c.count);
+    if (c.side != nullptr && c.side->built() && !c.side->insert(link, order)) {
+        c.side->give_up(c.count);
     }
     return true;
 }
@@ -115,18 +115,18 @@ bool remove_key(Collection<V>& c, const Key& key, const Order& order) noexcept {
     Node* below = nullptr;
     if (smaller != nullptr && larger != nullptr) {
         // The largest smaller key is the left subtree's largest node.
-        below = place.found.match != Place<Node>::kNone ? *c.links->link(c.links->below(place.found))
+        below = place.found.match != Place<Node>::kNone ? *c.side->link(c.side->below(place.found))
                                                         : TreeSteps<Node>::largest(smaller);
     }
     TreeSteps<Node>::detach(place.link, below);
     // Only the two children now hang from other links.
     if (place.found.match != Place<Node>::kNone) {
-        c.links->erase(place.found.match, place.found.parent);
+        c.side->erase(place.found.match, place.found.parent);
         if (smaller != nullptr) {
-            c.links->relink(c.links->find(smaller->value, order).match, place.link);
+            c.side->relink(c.side->find(smaller->value, order).match, place.link);
         }
         if (larger != nullptr) {
-            c.links->relink(c.links->find(larger->value, order).match, smaller != nullptr ? &below->right : place.link);
+            c.side->relink(c.side->find(larger->value, order).match, smaller != nullptr ? &below->right : place.link);
         }
     }
     if (c.index != nullptr) {
@@ -136,7 +136,7 @@ bool remove_key(Collection<V>& c, const Key& key, const Order& order) noexcept {
     memory::release(removed);
     --c.count;
     if (place.found.match != Place<Node>::kNone) {
-        c.links->fit();
+        c.side->fit();
     }
     return true;
 }
@@ -149,8 +149,8 @@ void free_nodes(TreeNode<V>* root) noexcept {
 template <class V>
 void clear_collection(Collection<V>& c) noexcept {
     c.count = 0;
-    if (c.links != nullptr) {
-        c.links->drop();
+    if (c.side != nullptr) {
+        c.side->drop();
     }
     if (c.index != nullptr) {
         c.index->clear();

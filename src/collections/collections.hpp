@@ -10,8 +10,8 @@
 #include <optional>
 
 #include "collections/insertion_index.hpp"
-#include "collections/link_index.hpp"
 #include "collections/memory.hpp"
+#include "collections/side_structure.hpp"
 #include "collections/tree.hpp"
 
 namespace sorvel {
@@ -24,11 +24,11 @@ template <class V>
 struct Collection {
     using Node = TreeNode<V>;
     using Index = InsertionIndex<Node>;
-    using Links = LinkIndex<Node>;
+    using Side = SideStructure<Node>;
     Node*& root;
     std::int32_t& count;
-    Index* index;            // null when the collection keeps no index
-    Links* links = nullptr;  // null: plain descents whatever the depth
+    Index* index;          // null when the collection keeps no index
+    Side* side = nullptr;  // null: plain descents whatever the depth
 };
 
 using IntegerCollection = Collection<std::int32_t>;
@@ -108,10 +108,10 @@ const TreeNode<V>* node_at(Collection<V> c, std::int32_t position) noexcept {
 }
 
 // Instance storage for the side structures of the three collections.
-struct LinkIndexes {
-    LinkIndex<IntegerNode> integers;
-    LinkIndex<FloatNode> floats;
-    LinkIndex<StringNode> strings;
+struct SideStructures {
+    SideStructure<IntegerNode> integers;
+    SideStructure<FloatNode> floats;
+    SideStructure<StringNode> strings;
 };
 
 }  // namespace sorvel

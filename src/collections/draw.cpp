@@ -4,7 +4,9 @@
 
 namespace sorvel {
 
-int draw_from_runtime() noexcept { return std::rand() & kDrawMask; }
+int draw_from_runtime() noexcept {
+    return std::rand() & kDrawMask;
+}
 
 DrawSource runtime_draws() noexcept {
     return {[](void*) noexcept { return draw_from_runtime(); }, nullptr};

@@ -20,11 +20,11 @@ struct ParamReader {
 // the record's reader pointer also finds the side structures of the trees.
 struct InstanceBlock {
     ParamReader reader;
-    LinkIndexes links;
+    SideStructures side;
 };
 
-inline LinkIndexes* links_of(const RunRecord* r) noexcept {
-    return r->reader == nullptr ? nullptr : &reinterpret_cast<InstanceBlock*>(r->reader)->links;
+inline SideStructures* side_structures_of(const RunRecord* r) noexcept {
+    return r->reader == nullptr ? nullptr : &reinterpret_cast<InstanceBlock*>(r->reader)->side;
 }
 
 // Host types for expression parameters, and selectors for event parameters.
@@ -82,15 +82,15 @@ word string_result(RunRecord* record, const char* text) noexcept;
 // Views of an instance's collections.
 // An instance without its block gets plain descents.
 inline IntegerCollection integers(RunRecord* r) noexcept {
-    LinkIndexes* l = links_of(r);
+    SideStructures* l = side_structures_of(r);
     return {r->integer_root, r->integer_count, r->integer_index, l == nullptr ? nullptr : &l->integers};
 }
 inline FloatCollection floats(RunRecord* r) noexcept {
-    LinkIndexes* l = links_of(r);
+    SideStructures* l = side_structures_of(r);
     return {r->float_root, r->float_count, r->float_index, l == nullptr ? nullptr : &l->floats};
 }
 inline StringCollection strings(RunRecord* r) noexcept {
-    LinkIndexes* l = links_of(r);
+    SideStructures* l = side_structures_of(r);
     return {r->string_root, r->string_count, r->string_index, l == nullptr ? nullptr : &l->strings};
 }
 inline bool case_sensitive(const RunRecord* r) noexcept {

@@ -67,23 +67,24 @@ std::string check_index(const InsertionIndex<Node>& index, std::int32_t count) {
 // rise strictly under `order`, and no child may outrank its parent. With an
 // index, every node of the tree must sit in its slot.
 template <class Node, class Order>
-std::string check_collection(Node* const* root, std::int32_t count, const LinkIndex<Node>* links,
+std::string check_collection(Node* const* root, std::int32_t count, const SideStructure<Node>* structure,
                              const InsertionIndex<Node>* index, const Order& order) {
-    using Links = LinkIndex<Node>;
+    using Side = SideStructure<Node>;
     if (index != nullptr) {
         if (std::string fault = check_index(*index, count); !fault.empty()) {
             return fault;
         }
     }
-    const bool side = links != nullptr && links->built();
-    if (side && links->size() != static_cast<std::uint32_t>(count)) {
-        return "side structure: " + std::to_string(links->size()) + " entries for " + std::to_string(count) + " values";
+    const bool side = structure != nullptr && structure->built();
+    if (side && structure->size() != static_cast<std::uint32_t>(count)) {
+        return "side structure: " + std::to_string(structure->size()) + " entries for " + std::to_string(count) +
+               " values";
     }
     std::vector<Node* const*> nodes;  // links whose left subtree is still to walk
     std::vector<std::uint32_t> entries;
     std::int32_t seen = 0;
-    const typename Links::Entry* previous = nullptr;
-    std::uint32_t e = side ? links->root() : Links::kNone;
+    const typename Side::Entry* previous = nullptr;
+    std::uint32_t e = side ? structure->root() : Side::kNone;
     for (Node* const* at = root; *at != nullptr || !nodes.empty();) {
         for (; *at != nullptr; at = &(*at)->left) {
             if (nodes.size() > static_cast<std::size_t>(count)) {
@@ -101,8 +102,8 @@ std::string check_collection(Node* const* root, std::int32_t count, const LinkIn
             return "index: a node of the tree is not in its slot " + std::to_string(node->order);
         }
         if (side) {
-            for (; e != Links::kNone; e = links->entry(e).left) {
-                if (e >= links->capacity() || entries.size() >= links->size()) {
+            for (; e != Side::kNone; e = structure->entry(e).left) {
+                if (e >= structure->capacity() || entries.size() >= structure->size()) {
                     return "side structure: entry " + std::to_string(e) + " out of the pool or reached twice";
                 }
                 entries.push_back(e);
@@ -112,10 +113,10 @@ std::string check_collection(Node* const* root, std::int32_t count, const LinkIn
             }
             const std::uint32_t x = entries.back();
             entries.pop_back();
-            const typename Links::Entry& entry = links->entry(x);
+            const typename Side::Entry& entry = structure->entry(x);
             for (const std::uint32_t child : {entry.left, entry.right}) {
-                if (child != Links::kNone && child < links->capacity() &&
-                    links->entry(child).priority > entry.priority) {
+                if (child != Side::kNone && child < structure->capacity() &&
+                    structure->entry(child).priority > entry.priority) {
                     return "side structure: entry " + std::to_string(child) + " outranks its parent " +
                            std::to_string(x);
                 }
@@ -134,7 +135,7 @@ std::string check_collection(Node* const* root, std::int32_t count, const LinkIn
     if (seen != count) {
         return "tree: " + std::to_string(seen) + " nodes for a count of " + std::to_string(count);
     }
-    if (side && (e != Links::kNone || !entries.empty())) {
+    if (side && (e != Side::kNone || !entries.empty())) {
         return "side structure: more entries in order than nodes in the tree";
     }
     return {};
@@ -146,18 +147,17 @@ inline std::string check_collection(const RunRecord& r, int collection) {
     if (r.reader == nullptr) {
         return {};
     }
-    const LinkIndexes& links = reinterpret_cast<const InstanceBlock*>(r.reader)->links;
+    const SideStructures& side = reinterpret_cast<const InstanceBlock*>(r.reader)->side;
     std::string fault;
     switch (collection) {
         case 0:
-            fault =
-                check_collection(&r.integer_root, r.integer_count, &links.integers, r.integer_index, IntegerOrder{});
+            fault = check_collection(&r.integer_root, r.integer_count, &side.integers, r.integer_index, IntegerOrder{});
             return fault.empty() ? fault : "integers: " + fault;
         case 1:
-            fault = check_collection(&r.float_root, r.float_count, &links.floats, r.float_index, FloatOrder{});
+            fault = check_collection(&r.float_root, r.float_count, &side.floats, r.float_index, FloatOrder{});
             return fault.empty() ? fault : "floats: " + fault;
         default:
-            fault = check_collection(&r.string_root, r.string_count, &links.strings, r.string_index,
+            fault = check_collection(&r.string_root, r.string_count, &side.strings, r.string_index,
                                      StringOrder{r.case_sensitive == 1});
             return fault.empty() ? fault : "strings: " + fault;
     }

@@ -14,41 +14,11 @@
 
 #include "collections/collections.hpp"
 #include "collections/random_path.hpp"
+#include "holder.hpp"
 #include "small_stack.hpp"
 #include "test_host.hpp"
 
 namespace sorvel::test {
-
-// Owns what a collection view refers to; frees tree, index and side
-// structure at the end. Without links the view descends plainly.
-template <class V>
-struct Holder {
-    using Node = TreeNode<V>;
-    Node* root = nullptr;
-    std::int32_t count = 0;
-    InsertionIndex<Node>* index = nullptr;
-    LinkIndex<Node> links;
-    bool with_links;
-
-    explicit Holder(bool with_index = false, bool side = true)
-        : index(with_index ? create_index<Node>() : nullptr), with_links(side) {}
-    Holder(const Holder&) = delete;
-    Holder& operator=(const Holder&) = delete;
-    ~Holder() {
-        Collection<V> c = view();
-        clear(c);
-        destroy_index(index);
-    }
-    Collection<V> view() { return Collection<V>{root, count, index, with_links ? &links : nullptr}; }
-    // The values at positions 0, 1, ... of the index.
-    std::vector<V> positions() {
-        std::vector<V> out;
-        for (std::int32_t p = 0; index != nullptr && p < count; ++p) {
-            out.push_back(node_at(view(), p)->value);
-        }
-        return out;
-    }
-};
 
 // Preorder with "-" for every empty link, without recursion: equal texts
 // mean equal trees. `children(n)` gives {left, right}, `text(n)` a value.

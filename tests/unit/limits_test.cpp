@@ -43,7 +43,7 @@ void deep_chain(int pattern) {
     const std::size_t live = testhost::counting::live();
     const std::vector<int> steps = directions(kDeep, pattern);
     ASSERT_TRUE(sorvel::testing::run_on_small_stack([&] {
-        Holder<V> h;
+        Holder<V> h(false, true);
         test::link_chain(h, steps);
         Collection<V> c = h.view();
         const TreeNode<V>* deepest = h.root;
@@ -83,7 +83,7 @@ TEST(DeepChains, WorkAndFreeOnASmallStack) {
 // The pick is k + 1 steps down with k below 32768, on a path longer than that.
 TEST(RandomPath, PicksOnWalksBeyond32768) {
     const std::vector<int> steps = directions(40'000, 2);
-    Holder<std::int32_t> h;
+    Holder<std::int32_t> h(false, true);
     test::link_chain(h, steps);
     for (int pick : {0, 1, 16385, 32767}) {
         std::vector<int> draws(steps.begin(), steps.end());
@@ -115,7 +115,7 @@ TEST(BalancedLoad, BeyondTheReachOfOneDraw) {
         draws.push_back(left % 7 == 0 ? static_cast<int>(random() & 0x7FFF)
                                       : static_cast<int>(std::min<std::size_t>(left - 1, 32767)));
     }
-    Holder<char*> h;
+    Holder<char*> h(false, true);
     StringCollection c = h.view();
     std::string bytes = file + '\0';
     test::ScriptedDraws scripted{draws};

@@ -41,7 +41,7 @@ std::vector<std::pair<std::int32_t, bool>> grow_then_shrink(Ints& h) {
 TEST(SideStructure, AllocationFailuresCostNoData) {
     std::uint64_t allocations = testhost::counting::total();
     {
-        Ints side(true);
+        Ints side(true, true);
         grow_then_shrink(side);
     }
     allocations = testhost::counting::total() - allocations;
@@ -49,7 +49,7 @@ TEST(SideStructure, AllocationFailuresCostNoData) {
         SCOPED_TRACE(fail);
         const std::size_t live = testhost::counting::live();
         {
-            Ints side(true), plain(true, false);
+            Ints side(true, true), plain(true, false);
             testhost::counting::fail_after(fail);
             const auto done = grow_then_shrink(side);
             testhost::counting::fail_after(-1);
@@ -78,7 +78,7 @@ TEST(SideStructure, PositionsAcrossShrinkCycles) {
     for (const bool sorted : {true, false}) {
         SCOPED_TRACE(sorted);
         std::mt19937 random(9);
-        Ints h(true);
+        Ints h(true, true);
         std::vector<std::int32_t> added;  // in the order of the Adds; removed ones leave the list
         for (int cycle = 0; cycle < 3; ++cycle) {
             while (h.count < kPeak) {
@@ -121,7 +121,7 @@ TEST(SideStructure, PositionsAcrossShrinkCycles) {
                 ASSERT_EQ(position_of(h.view(), added[p]), static_cast<std::int32_t>(p));
             }
             EXPECT_LE(h.index->capacity(), 4 * added.size() + 8);
-            EXPECT_LE(h.links.capacity(), 4 * added.size() + 64);
+            EXPECT_LE(h.side.capacity(), 4 * added.size() + 64);
         }
     }
 }

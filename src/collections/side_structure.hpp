@@ -17,7 +17,7 @@
 namespace sorvel {
 
 template <class Node>
-class LinkIndex {
+class SideStructure {
 public:
     using Value = decltype(Node::value);
     static constexpr std::uint32_t kNone = 0xFFFFFFFFU;
@@ -38,10 +38,10 @@ public:
         std::uint32_t above = kNone;   // smallest entry larger than the key
     };
 
-    LinkIndex() noexcept = default;
-    LinkIndex(const LinkIndex&) = delete;
-    LinkIndex& operator=(const LinkIndex&) = delete;
-    ~LinkIndex() { memory::release(pool_); }
+    SideStructure() noexcept = default;
+    SideStructure(const SideStructure&) = delete;
+    SideStructure& operator=(const SideStructure&) = delete;
+    ~SideStructure() { memory::release(pool_); }
 
     [[nodiscard]] bool built() const noexcept { return pool_ != nullptr; }
     [[nodiscard]] Node** link(std::uint32_t e) const noexcept { return pool_[e].link; }
