@@ -704,8 +704,8 @@ Instance& Host::create(std::int32_t case_sensitive, std::int32_t use_indices, st
     instances_.push_back(std::move(instance));
     Instance& created = *instances_.back();
     g_active = this;
-    created.create_result_ = library_->call_export(
-        "CreateRunObject", {created.address(), reinterpret_cast<word>(edit), reinterpret_cast<word>(creation)});
+    library_->call_export("CreateRunObject",
+                          {created.address(), reinterpret_cast<word>(edit), reinterpret_cast<word>(creation)});
     return created;
 }
 
@@ -714,7 +714,7 @@ void Host::destroy(Instance& instance, word second) {
         throw std::logic_error("instance destroyed twice");
     }
     g_active = this;
-    instance.destroy_result_ = library_->call_export("DestroyRunObject", {instance.address(), second});
+    library_->call_export("DestroyRunObject", {instance.address(), second});
     instance.destroyed_ = true;
 }
 
@@ -772,11 +772,6 @@ std::string Host::text_at(word result) {
 
 float Host::float_bits(word result) {
     return std::bit_cast<float>(static_cast<std::uint32_t>(static_cast<std::uintptr_t>(result)));
-}
-
-std::size_t Host::calls_to(HostCall::Routine routine) const {
-    return static_cast<std::size_t>(
-        std::count_if(calls_.begin(), calls_.end(), [routine](const HostCall& c) { return c.routine == routine; }));
 }
 
 }  // namespace sorvel::testhost

@@ -210,17 +210,12 @@ public:
     word index(int collection) const;
 
     // What CreateRunObject and DestroyRunObject gave.
-    word create_result() const { return create_result_; }
-    word destroy_result() const { return destroy_result_; }
-    bool destroyed() const { return destroyed_; }
     std::size_t size() const { return record_.size(); }
 
 private:
     friend class Host;
     std::vector<unsigned char> record_;
     bool destroyed_ = false;
-    word create_result_ = -1;
-    word destroy_result_ = -1;
 };
 
 // Reads a tree read-only at its documented layout.
@@ -252,7 +247,6 @@ public:
     // tables from it; gives its result.
     word read_infos(unsigned char fill = 0xAB);
     const std::vector<unsigned char>& info_block() const { return info_block_; }
-    word run_record_size() const { return record_size_; }
     struct Tables {
         word conditions = 0, actions = 0, expressions = 0;
         std::uint16_t condition_count = 0, action_count = 0, expression_count = 0, edit_size = 0;
@@ -283,7 +277,6 @@ public:
     // Recorded host routine calls since the last clear.
     const std::vector<HostCall>& calls() const { return calls_; }
     void clear_calls() { calls_.clear(); }
-    std::size_t calls_to(HostCall::Routine routine) const;
     // Left from the last handler call; each handler call starts a new queue.
     std::size_t unconsumed_params() const { return params_.size() - next_param_; }
     // Parameter requests the queue could not serve (they got 0).
