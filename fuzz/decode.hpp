@@ -1,6 +1,6 @@
 // Decoding an input into events for one to three object instances.
 //
-// Input: six bytes of words for the exports; one byte for the number of
+// Input: five bytes of words for the exports; one byte for the number of
 // instances, then per instance a byte of option words and two bytes of a
 // creation word; then events, one byte each (low 5 bits the kind, high 3
 // bits the instance) followed by the bytes their values take. Past its end
