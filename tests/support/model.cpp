@@ -289,9 +289,7 @@ bool Instance::contains_string(const Text& v) const {
     if (!s) {
         return false;
     }
-    const bool cs = case_sensitive();
-    return tree_contains(strings_, *s,
-                         [cs](const std::string& a, const std::string& b) { return compare_strings(a, b, cs); });
+    return tree_contains(strings_, *s, string_order());
 }
 
 void Instance::add_integer(std::int32_t v) {
@@ -319,9 +317,7 @@ void Instance::add_string(const Text& v) {
     if (!s) {
         return;
     }
-    const bool cs = case_sensitive();
-    tree_add(strings_, *s, indexed(),
-             [cs](const std::string& a, const std::string& b) { return compare_strings(a, b, cs); });
+    tree_add(strings_, *s, indexed(), string_order());
 }
 
 void Instance::remove_string(const Text& v) {
@@ -329,9 +325,7 @@ void Instance::remove_string(const Text& v) {
     if (!s) {
         return;
     }
-    const bool cs = case_sensitive();
-    tree_remove(strings_, *s, indexed(),
-                [cs](const std::string& a, const std::string& b) { return compare_strings(a, b, cs); });
+    tree_remove(strings_, *s, indexed(), string_order());
 }
 
 void Instance::clear(int collection) {

@@ -63,6 +63,11 @@ public:
     std::int32_t index_word() const { return index_word_; }
     bool case_sensitive() const { return case_word_ == 1; }
     bool indexed() const { return index_word_ == 1; }
+    // The string collection's order under the case option.
+    auto string_order() const {
+        return
+            [cs = case_sensitive()](const std::string& a, const std::string& b) { return compare_strings(a, b, cs); };
+    }
 
     // A string parameter as the host gives it: nullopt for a null pointer;
     // otherwise the characters before the first zero byte count.
