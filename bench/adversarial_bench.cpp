@@ -167,13 +167,13 @@ std::int64_t play(IntegerCollection c, const Script& script) {
     return play(c, script.steps.data(), script.steps.data() + script.steps.size());
 }
 
-// Allocation failures through the test host's counting allocator, which
+// Allocation failures through the simulated host's counting allocator, which
 // stands behind the allocation seam in this program.
 std::uint64_t allocations_so_far() {
-    return testhost::counting::total();
+    return test::counting::total();
 }
 void fail_allocation_after(long n) {
-    testhost::counting::fail_after(n);
+    test::counting::fail_after(n);
 }
 
 // The last Add of a script that allocates more than its node (a growth of

@@ -12,7 +12,7 @@
 #include "bench_fields.hpp"
 #include "collections/collections.hpp"
 #include "collections/random_path.hpp"
-#include "test_host.hpp"
+#include "simulated_host.hpp"
 
 namespace {
 
@@ -126,11 +126,11 @@ BENCHMARK(BM_Scale_Remove)
 // ---- Chains through the exported interface ----------------------------------
 
 void BM_Chain_Interface_Add(benchmark::State& state) {
-    using testhost::Param;
+    using simulated::Param;
     const auto n = static_cast<std::int32_t>(state.range(0));
-    testhost::Host host(testhost::Library::linked_in());
+    simulated::Host host(simulated::Library::linked_in());
     for (auto _ : state) {
-        testhost::Instance& i = host.create(1, 0);
+        simulated::Instance& i = host.create(1, 0);
         for (std::int32_t v = 0; v < n; ++v) {
             host.event(i, "Add Integer: %0", {Param::of(v)});
         }
@@ -145,10 +145,10 @@ void BM_Chain_Interface_Add(benchmark::State& state) {
 BENCHMARK(BM_Chain_Interface_Add)->Arg(1'000)->Arg(5'000)->Arg(20'000)->Unit(benchmark::kMillisecond);
 
 void BM_Chain_Interface_RandomElement(benchmark::State& state) {
-    using testhost::Param;
+    using simulated::Param;
     const auto n = static_cast<std::int32_t>(state.range(0));
-    testhost::Host host(testhost::Library::linked_in());
-    testhost::Instance& i = host.create(1, 0);
+    simulated::Host host(simulated::Library::linked_in());
+    simulated::Instance& i = host.create(1, 0);
     for (std::int32_t v = 0; v < n; ++v) {
         host.event(i, "Add Integer: %0", {Param::of(v)});
     }

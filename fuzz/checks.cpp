@@ -7,6 +7,7 @@
 #include <string_view>
 #include <utility>
 
+#include "draws.hpp"
 #include "exports_table.hpp"
 #include "invariants.hpp"
 #include "session.hpp"
@@ -15,11 +16,11 @@
 namespace fuzzdriver {
 namespace {
 
-namespace draws = sorvel::testhost::draws;
-using sorvel::testhost::HostCall;
-using sorvel::testhost::Library;
-using sorvel::testhost::NodeView;
-using sorvel::testhost::RecordLayout;
+namespace draws = sorvel::test::draws;
+using sorvel::simulated::HostCall;
+using sorvel::simulated::Library;
+using sorvel::simulated::NodeView;
+using sorvel::simulated::RecordLayout;
 using Routine = HostCall::Routine;
 
 constexpr std::size_t kTreeEvery = 32;      // events between whole-tree comparisons
@@ -103,7 +104,7 @@ void Session::call_exports() {
 
 // What CreateRunObject must have left in the record.
 void Session::check_created(Subject& s, const Options& o) {
-    sorvel::testhost::Instance& h = *s.host;
+    sorvel::simulated::Instance& h = *s.host;
     expect_equal(h.i32(RecordLayout::kCaseSensitive), o.case_word, "case-sensitive flag as stored");
     expect_equal(h.i32(RecordLayout::kUseIndices), o.index_word, "use-indices flag as stored");
     expect_equal(h.i32(RecordLayout::kCreationWordA), o.creation8, "creation word at byte 76");

@@ -6,14 +6,14 @@
 #include <cstdint>
 #include <memory>
 
-#include "test_host.hpp"
+#include "simulated_host.hpp"
 
 namespace fuzzdriver {
 // The library the inputs run against: the one linked in, unless a caller
 // chose another before the first input.
-std::shared_ptr<sorvel::testhost::Library>& library();
+std::shared_ptr<sorvel::simulated::Library>& library();
 // Whether that library is the one linked in, whose side structures the
-// driver can inspect: a library the test host loaded may lay them out
+// driver can inspect: a library the simulated host loaded may lay them out
 // otherwise, and is held against the model alone.
 bool inspectable();
 }  // namespace fuzzdriver

@@ -14,7 +14,7 @@
 
 namespace {
 
-using sorvel::testhost::Library;
+using sorvel::simulated::Library;
 
 const std::shared_ptr<Library>& linked_in() {
     static const std::shared_ptr<Library> library = Library::linked_in();

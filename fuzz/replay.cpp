@@ -4,7 +4,7 @@
 //
 //   fuzz_replay [--library PATH [--relocate]] FILE_OR_FOLDER...
 //
-// --library drives a library the test host loads instead of the one linked in;
+// --library drives a library the simulated host loads instead of the one linked in;
 // --relocate keeps a Windows DLL off its preferred base, so that the loader
 // applies its relocations.
 #include <algorithm>
@@ -20,7 +20,7 @@
 
 int main(int argc, char** argv) {
     namespace fs = std::filesystem;
-    using sorvel::testhost::Library;
+    using sorvel::simulated::Library;
     std::vector<fs::path> inputs;
     std::string library;
     Library::Placement placement = Library::Placement::preferred;

@@ -9,6 +9,7 @@
 #include <string_view>
 #include <utility>
 
+#include "draws.hpp"
 #include "driver.hpp"
 #include "host/catalogue.hpp"
 
@@ -16,10 +17,10 @@ namespace fuzzdriver {
 namespace {
 
 namespace catalogue = sorvel::catalogue;
-namespace draws = sorvel::testhost::draws;
-using sorvel::testhost::Host;
-using sorvel::testhost::HostCall;
-using sorvel::testhost::Param;
+namespace draws = sorvel::test::draws;
+using sorvel::simulated::Host;
+using sorvel::simulated::HostCall;
+using sorvel::simulated::Param;
 using Routine = HostCall::Routine;
 
 constexpr std::size_t kSweepFull = 24;  // larger collections are sampled

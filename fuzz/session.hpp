@@ -1,5 +1,5 @@
 // Expectations from the model: one input's events run through the library's
-// real handler tables by way of the test host (the library linked in, so
+// real handler tables by way of the simulated host (the library linked in, so
 // libFuzzer sees its coverage, or one the host loaded, for the replay), with
 // every draw scripted where the generator can be scripted and learnt in
 // advance where it cannot. After every event the library is held against
@@ -23,15 +23,15 @@
 #include "decode.hpp"
 #include "model.hpp"
 #include "report.hpp"
-#include "test_host.hpp"
+#include "simulated_host.hpp"
 
 namespace fuzzdriver {
 
-using sorvel::testhost::word;
+using sorvel::simulated::word;
 
 // One instance, in the library and in the model.
 struct Subject {
-    sorvel::testhost::Instance* host = nullptr;
+    sorvel::simulated::Instance* host = nullptr;
     std::unique_ptr<fuzzmodel::Instance> model;
     std::array<word, 3> indexes{};
     word reader = 0;
@@ -41,9 +41,9 @@ struct Subject {
 // What one host routine call must look like; an argument of nullopt is not
 // checked (pointers the library takes from the host).
 struct ExpectedCall {
-    sorvel::testhost::HostCall::Routine routine;
+    sorvel::simulated::HostCall::Routine routine;
     std::array<std::optional<word>, 3> args;
-    std::size_t count() const { return routine == sorvel::testhost::HostCall::Routine::close_file ? 1 : 3; }
+    std::size_t count() const { return routine == sorvel::simulated::HostCall::Routine::close_file ? 1 : 3; }
 };
 
 // Walks the library's string tree and the model's side by side: the model's
@@ -82,14 +82,14 @@ private:
     void check_invariants(Subject& s, int collection);
 
     Decoder decoder_;
-    sorvel::testhost::Host host_;
+    sorvel::simulated::Host host_;
     std::vector<Subject> subjects_;
     std::vector<const fuzzmodel::Instance*> models_;  // the subjects', for the decoder
     std::size_t event_number_ = 0;
     std::size_t handler_calls_ = 0;
-    const sorvel::testhost::Library::Allocations* allocations_;  // null: no failure can be injected
+    const sorvel::simulated::Library::Allocations* allocations_;  // null: no failure can be injected
     // Reused from call to call, so that an event allocates nothing of its own.
-    std::vector<sorvel::testhost::Param> params_;
+    std::vector<sorvel::simulated::Param> params_;
     std::vector<ExpectedCall> calls_;
     Event event_;
     std::size_t live_at_start_ = 0;

@@ -4,10 +4,12 @@
 #include <bit>
 #include <limits>
 
+#include "draws.hpp"
+
 namespace fuzzdriver {
 namespace {
 
-namespace draws = sorvel::testhost::draws;
+namespace draws = sorvel::test::draws;
 
 // Bounds that keep one execution in the millisecond range.
 constexpr std::size_t kMaxFileBytes = 160;

@@ -12,7 +12,7 @@
 #include <vector>
 
 #include "model.hpp"
-#include "test_host.hpp"
+#include "simulated_host.hpp"
 
 namespace fuzzdriver {
 

@@ -13,8 +13,9 @@
 #include <string>
 #include <vector>
 
+#include "draws.hpp"
+#include "simulated_host.hpp"
 #include "support.hpp"
-#include "test_host.hpp"
 
 #if defined(_WIN32)
 #include <windows.h>
@@ -22,13 +23,13 @@
 
 namespace {
 
-namespace draws = sorvel::testhost::draws;
-using sorvel::testhost::Host;
-using sorvel::testhost::Instance;
-using sorvel::testhost::Library;
-using sorvel::testhost::NodeView;
-using sorvel::testhost::Param;
-using sorvel::testhost::word;
+namespace draws = sorvel::test::draws;
+using sorvel::simulated::Host;
+using sorvel::simulated::Instance;
+using sorvel::simulated::Library;
+using sorvel::simulated::NodeView;
+using sorvel::simulated::Param;
+using sorvel::simulated::word;
 
 // The strings in order and both counts: all a failure may change.
 std::string contents(Instance& instance) {
@@ -98,7 +99,7 @@ TEST(Allocation, EveryAllocationOfAnAddOrALoadMayFail) {
 }
 
 #if defined(_WIN32)
-// The C runtime in a DLL allocates as it attaches, before the test host
+// The C runtime in a DLL allocates as it attaches, before the simulated host
 // reroutes its imports, and frees that as it detaches: such blocks pass to
 // the C runtime uncounted, so loading, using and unloading a second copy
 // leaves the count where it was.

@@ -4,7 +4,7 @@
 
 #include <gtest/gtest.h>
 
-#include "test_host.hpp"
+#include "simulated_host.hpp"
 
 namespace sorvel::e2e {
 
@@ -13,12 +13,12 @@ protected:
     void TearDown() override {
         // On i386 every call into the library is checked for the stdcall
         // contract: the callee must have removed exactly its arguments.
-        EXPECT_EQ(testhost::Library::stack_errors(), 0U) << "a callee removed the wrong number of argument bytes";
+        EXPECT_EQ(simulated::Library::stack_errors(), 0U) << "a callee removed the wrong number of argument bytes";
         EXPECT_EQ(host.open_handles(), 0U) << "every opened file is closed";
         EXPECT_EQ(host.bad_closes(), 0U) << "only opened handles are closed";
     }
 
-    testhost::Host host{testhost::Library::built()};
+    simulated::Host host{simulated::Library::built()};
 };
 
 }  // namespace sorvel::e2e

@@ -11,7 +11,7 @@
 #include <string>
 #include <vector>
 
-#include "e2e/e2e_fixture.hpp"
+#include "e2e_fixture.hpp"
 #include "exports_table.hpp"
 #include "host/catalogue.hpp"
 #include "support.hpp"
@@ -19,13 +19,13 @@
 namespace {
 
 using sorvel::e2e::HostTest;
-using sorvel::testhost::Host;
-using sorvel::testhost::HostCall;
-using sorvel::testhost::Instance;
-using sorvel::testhost::Library;
-using sorvel::testhost::Param;
-using sorvel::testhost::RecordLayout;
-using sorvel::testhost::word;
+using sorvel::simulated::Host;
+using sorvel::simulated::HostCall;
+using sorvel::simulated::Instance;
+using sorvel::simulated::Library;
+using sorvel::simulated::Param;
+using sorvel::simulated::RecordLayout;
+using sorvel::simulated::word;
 using Routine = HostCall::Routine;
 namespace catalogue = sorvel::catalogue;
 namespace answers = sorvel::answers;

@@ -15,8 +15,8 @@ namespace {
 
 using sorvel::script::Options;
 using sorvel::script::Runner;
-using sorvel::testhost::Host;
-using sorvel::testhost::Library;
+using sorvel::simulated::Host;
+using sorvel::simulated::Library;
 
 struct Case {
     std::string script;

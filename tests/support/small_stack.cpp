@@ -8,7 +8,7 @@
 #include <pthread.h>
 #endif
 
-namespace sorvel::testing {
+namespace sorvel::test {
 namespace {
 
 struct Work {
@@ -61,4 +61,4 @@ bool run_on_small_stack(const std::function<void()>& work, std::size_t stack_byt
     return state.finished;
 }
 
-}  // namespace sorvel::testing
+}  // namespace sorvel::test

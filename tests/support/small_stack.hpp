@@ -5,7 +5,7 @@
 #include <cstddef>
 #include <functional>
 
-namespace sorvel::testing {
+namespace sorvel::test {
 
 inline constexpr std::size_t kSmallStack = 256 * 1024;
 
@@ -14,4 +14,4 @@ inline constexpr std::size_t kSmallStack = 256 * 1024;
 // wine also gives a thread at least about 1 MiB whatever is asked for.
 [[nodiscard]] bool run_on_small_stack(const std::function<void()>& work, std::size_t stack_bytes = kSmallStack);
 
-}  // namespace sorvel::testing
+}  // namespace sorvel::test

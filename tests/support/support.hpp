@@ -15,8 +15,8 @@
 #include "collections/collections.hpp"
 #include "collections/random_path.hpp"
 #include "holder.hpp"
+#include "simulated_host.hpp"
 #include "small_stack.hpp"
-#include "test_host.hpp"
 
 namespace sorvel::test {
 
@@ -100,14 +100,14 @@ void link_chain(Holder<V>& h, const std::vector<int>& directions) {
 
 // The built library where its allocations can be counted (a Windows DLL,
 // through its rerouted imports), else the library linked in.
-inline std::shared_ptr<testhost::Library> counted_library() {
-    const auto built = testhost::Library::built();
-    return built->allocations() != nullptr ? built : testhost::Library::linked_in();
+inline std::shared_ptr<simulated::Library> counted_library() {
+    const auto built = simulated::Library::built();
+    return built->allocations() != nullptr ? built : simulated::Library::linked_in();
 }
 
 // Calls an export with the first `n` of seven words.
-inline testhost::word call_with(const testhost::Library& library, void* function, int n,
-                                const std::array<testhost::word, 7>& w) {
+inline simulated::word call_with(const simulated::Library& library, void* function, int n,
+                                 const std::array<simulated::word, 7>& w) {
     switch (n) {
         case 0: return library.call(function, {});
         case 1: return library.call(function, {w[0]});

@@ -40,9 +40,9 @@ std::vector<int> directions(std::size_t n, int pattern) {
 // along it would overflow; everything is freed at the end.
 template <class V>
 void deep_chain(int pattern) {
-    const std::size_t live = testhost::counting::live();
+    const std::size_t live = test::counting::live();
     const std::vector<int> steps = directions(kDeep, pattern);
-    ASSERT_TRUE(sorvel::testing::run_on_small_stack([&] {
+    ASSERT_TRUE(sorvel::test::run_on_small_stack([&] {
         Holder<V> h(false, true);
         test::link_chain(h, steps);
         Collection<V> c = h.view();
@@ -68,7 +68,7 @@ void deep_chain(int pattern) {
         }
         EXPECT_EQ(h.count, static_cast<std::int32_t>(kDeep + 1));
     })) << "the work on the small stack did not finish";
-    EXPECT_EQ(testhost::counting::live(), live);
+    EXPECT_EQ(test::counting::live(), live);
 }
 
 TEST(DeepChains, WorkAndFreeOnASmallStack) {

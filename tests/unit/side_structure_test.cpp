@@ -39,20 +39,20 @@ std::vector<std::pair<std::int32_t, bool>> grow_then_shrink(Ints& h) {
 // Every allocation in turn fails once: the collection loses at most the one
 // value whose own node could not be made, and stays equal to plain descents.
 TEST(SideStructure, AllocationFailuresCostNoData) {
-    std::uint64_t allocations = testhost::counting::total();
+    std::uint64_t allocations = test::counting::total();
     {
         Ints side(true, true);
         grow_then_shrink(side);
     }
-    allocations = testhost::counting::total() - allocations;
+    allocations = test::counting::total() - allocations;
     for (long fail = 0; fail < static_cast<long>(allocations); ++fail) {
         SCOPED_TRACE(fail);
-        const std::size_t live = testhost::counting::live();
+        const std::size_t live = test::counting::live();
         {
             Ints side(true, true), plain(true, false);
-            testhost::counting::fail_after(fail);
+            test::counting::fail_after(fail);
             const auto done = grow_then_shrink(side);
-            testhost::counting::fail_after(-1);
+            test::counting::fail_after(-1);
             int lost = 0;
             for (const auto& [v, took] : done) {
                 if (v < 0) {
@@ -67,7 +67,7 @@ TEST(SideStructure, AllocationFailuresCostNoData) {
             EXPECT_EQ(test::shape(side.root), test::shape(plain.root));
             EXPECT_EQ(side.positions(), plain.positions());
         }
-        EXPECT_EQ(testhost::counting::live(), live);
+        EXPECT_EQ(test::counting::live(), live);
     }
 }
 

@@ -119,8 +119,8 @@ int main(int argc, char** argv) {
     }
     try {
         auto library =
-            library_path.empty() ? sorvel::testhost::Library::built() : sorvel::testhost::Library::load(library_path);
-        sorvel::testhost::Host host(library);
+            library_path.empty() ? sorvel::simulated::Library::built() : sorvel::simulated::Library::load(library_path);
+        sorvel::simulated::Host host(library);
         if (seed >= 0) {
             library->seed_rand(static_cast<unsigned>(seed));
         }

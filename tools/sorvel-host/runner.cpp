@@ -11,10 +11,10 @@
 namespace sorvel::script {
 namespace {
 
-using testhost::Host;
-using testhost::HostCall;
-using testhost::NodeView;
-using testhost::Param;
+using simulated::Host;
+using simulated::HostCall;
+using simulated::NodeView;
+using simulated::Param;
 
 const char* const kCollectionNames[] = {"integers", "floats", "strings"};
 
@@ -82,7 +82,7 @@ const char* routine_name(HostCall::Routine r) {
     return "?";
 }
 
-std::string hex(testhost::word w) {
+std::string hex(simulated::word w) {
     char text[32];
     std::snprintf(text, sizeof text, "0x%llx", static_cast<unsigned long long>(static_cast<std::uintptr_t>(w)));
     return text;
@@ -166,7 +166,7 @@ Runner::Runner(Host& host, const Options& options, std::ostream& out, std::ostre
 }
 
 Runner::~Runner() {
-    for (testhost::Instance* instance : instances_) {
+    for (simulated::Instance* instance : instances_) {
         host_.destroy(*instance);
     }
 }
@@ -241,17 +241,21 @@ void Runner::run_event(const Command& c, const std::string& where) {
     for (const Value& v : c.values) {
         params.push_back(to_param(v));
     }
-    testhost::Instance& instance = *instances_[current_];
+    simulated::Instance& instance = *instances_[current_];
     instance.set_result_flags(0);
     host_.clear_calls();
-    const testhost::word result = host_.event(instance, c.event->display, std::move(params));
+    const simulated::word result = host_.event(instance, c.event->display, std::move(params));
     const std::string shown = prefix() + show_event(c);
     if (c.event->kind == catalogue::Kind::condition) {
         out_ << shown << " -> " << (result != 0 ? "true" : "false") << "\n";
     } else if (c.event->kind == catalogue::Kind::expression) {
         switch (c.event->info) {
-            case catalogue::kFloatResult: out_ << shown << " -> " << show_float(Host::float_bits(result)) << " (float)\n"; break;
-            case catalogue::kStringResult: out_ << shown << " -> " << quote(Host::text_at(result)) << " (string)\n"; break;
+            case catalogue::kFloatResult:
+                out_ << shown << " -> " << show_float(Host::float_bits(result)) << " (float)\n";
+                break;
+            case catalogue::kStringResult:
+                out_ << shown << " -> " << quote(Host::text_at(result)) << " (string)\n";
+                break;
             default: out_ << shown << " -> " << static_cast<std::int32_t>(result) << " (integer)\n"; break;
         }
     } else if (options_.trace) {
@@ -272,11 +276,11 @@ void Runner::print_trace() {
     for (const HostCall& call : host_.calls()) {
         out_ << "    " << routine_name(call.routine) << "(";
         for (std::size_t i = 0; i < call.args.size(); ++i) {
-            const testhost::word a = call.args[i];
+            const simulated::word a = call.args[i];
             const bool small = a > -65536 && a < 65536;
             out_ << (i == 0 ? "" : ", ") << (small ? std::to_string(a) : hex(a));
         }
-        const testhost::word r = call.result;
+        const simulated::word r = call.result;
         out_ << ") -> " << (r > -65536 && r < 65536 ? std::to_string(r) : hex(r)) << "\n";
     }
 }

@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "script.hpp"
-#include "test_host.hpp"
+#include "simulated_host.hpp"
 
 namespace sorvel::script {
 
@@ -22,7 +22,7 @@ struct Options {
 
 class Runner {
 public:
-    Runner(testhost::Host& host, const Options& options, std::ostream& out, std::ostream& err);
+    Runner(simulated::Host& host, const Options& options, std::ostream& out, std::ostream& err);
     ~Runner();
     Runner(const Runner&) = delete;
     Runner& operator=(const Runner&) = delete;
@@ -44,11 +44,11 @@ private:
     void print_trace();
     std::string prefix() const;
 
-    testhost::Host& host_;
+    simulated::Host& host_;
     Options options_;
     std::ostream& out_;
     std::ostream& err_;
-    std::vector<testhost::Instance*> instances_;
+    std::vector<simulated::Instance*> instances_;
     std::size_t current_ = 0;
     bool done_ = false;
 };
@@ -59,11 +59,11 @@ struct TreeFacts {
     std::size_t nodes = 0;
     std::size_t depth = 0;
 };
-TreeFacts tree_facts(testhost::NodeView root);
+TreeFacts tree_facts(simulated::NodeView root);
 
 // A value as the tool shows it: integers in decimal, floats as %g, strings
 // quoted with escapes for bytes that would not print.
-std::string show_value(testhost::NodeView node, int collection);
+std::string show_value(simulated::NodeView node, int collection);
 std::string quote(const std::string& text);
 
 }  // namespace sorvel::script

@@ -1,7 +1,7 @@
 /*
  * Calls a function that must remove its own arguments (stdcall) and measures
  * whether it did. cdecl itself:
- *   word sorvel_testhost_stdcall_call(void* fn, const word* args, word count,
+ *   word sorvel_simulated_host_stdcall_call(void* fn, const word* args, word count,
  *                                     word* delta)
  * The arguments are pushed right to left onto a 16-byte aligned stack, which
  * suits both the i386 System V ABI and Windows (4 bytes). *delta receives the
@@ -12,9 +12,9 @@
  * leading underscore, on Windows.
  */
 #if defined(_WIN32)
-#define STDCALL_CALL _sorvel_testhost_stdcall_call
+#define STDCALL_CALL _sorvel_simulated_host_stdcall_call
 #else
-#define STDCALL_CALL sorvel_testhost_stdcall_call
+#define STDCALL_CALL sorvel_simulated_host_stdcall_call
 #endif
         .text
         .globl  STDCALL_CALL

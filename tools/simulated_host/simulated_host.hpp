@@ -1,4 +1,4 @@
-// The test host: plays the host runtime for the library, the way a real host
+// The simulated host: plays the host runtime for the library, the way a real host
 // calls it. It loads the built library, calls DllMain as a loader would,
 // reads the handler tables from GetRunObjectInfos, hands out zero-filled run
 // records, serves the host routines and records every call made to them.
@@ -20,7 +20,7 @@
 #include <string_view>
 #include <vector>
 
-namespace sorvel::testhost {
+namespace sorvel::simulated {
 
 using word = std::intptr_t;
 
@@ -95,7 +95,7 @@ public:
     // Seeds the C runtime generator that the library shares with this program.
     void seed_rand(unsigned seed) const;
 
-    // What the loader calls: DllMain itself where the test host plays the
+    // What the loader calls: DllMain itself where the simulated host plays the
     // loader (ELF, linked in), the module's entry point on Windows, where the
     // real loader has already made the process attach call.
     void* entry_point() const;
@@ -328,19 +328,4 @@ private:
     std::set<word> open_files_;
 };
 
-// The runtime generator the library draws from. On ELF targets this program
-// defines rand itself, so every draw is scripted and counted; on Windows the
-// shared C runtime generator is seeded and its sequence learnt in advance.
-namespace draws {
-// Reseeds and gives the next n values (low 15 bits) the library will draw.
-std::vector<int> reseed(unsigned seed, std::size_t n);
-// ELF only: the exact values the next draws give (then the seeded sequence).
-bool scriptable();
-void script(std::vector<int> values);
-// Draws made since the last reseed or script. On Windows it is found by
-// matching the generator's next values against the learnt sequence, after
-// which the generator is put back where it was.
-std::size_t made();
-}  // namespace draws
-
-}  // namespace sorvel::testhost
+}  // namespace sorvel::simulated

@@ -4,29 +4,29 @@
 // object is pulled in only by programs that call Library::linked_in, which
 // are the ones that link the library.
 #include "host/exports.hpp"
-#include "test_host.hpp"
+#include "simulated_host.hpp"
 
-using sorvel::testhost::word;
+using sorvel::simulated::word;
 
 // Declarations with the library's argument counts and calling convention,
 // so that on 32-bit Windows the decorated names match the definitions.
-#define TESTHOST_DECLARE_EXPORT(name, ordinal, count) extern "C" word SORVEL_CALL name SORVEL_ARGS##count;
-#define TESTHOST_DECLARE_STUB(name, ordinal, params, result) extern "C" word SORVEL_CALL name params;
-SORVEL_EXPORT_LIST(TESTHOST_DECLARE_EXPORT)
-SORVEL_STUB_LIST(TESTHOST_DECLARE_STUB)
+#define SIMULATED_DECLARE_EXPORT(name, ordinal, count) extern "C" word SORVEL_CALL name SORVEL_ARGS##count;
+#define SIMULATED_DECLARE_STUB(name, ordinal, params, result) extern "C" word SORVEL_CALL name params;
+SORVEL_EXPORT_LIST(SIMULATED_DECLARE_EXPORT)
+SORVEL_STUB_LIST(SIMULATED_DECLARE_STUB)
 extern "C" word SORVEL_CALL DllMain(word, word, word);
 
-namespace sorvel::testhost {
+namespace sorvel::simulated {
 
 std::shared_ptr<Library> Library::linked_in() {
     std::shared_ptr<Library> library(new Library());
     library->allocations_ = counter() != nullptr ? &counter()->allocations : nullptr;
-#define TESTHOST_ENTRY(name, ordinal, ...) library->symbols_.push_back(Symbol{#name, reinterpret_cast<void*>(&name)});
-    SORVEL_EXPORT_LIST(TESTHOST_ENTRY)
-    SORVEL_STUB_LIST(TESTHOST_ENTRY)
-#undef TESTHOST_ENTRY
+#define SIMULATED_ENTRY(name, ordinal, ...) library->symbols_.push_back(Symbol{#name, reinterpret_cast<void*>(&name)});
+    SORVEL_EXPORT_LIST(SIMULATED_ENTRY)
+    SORVEL_STUB_LIST(SIMULATED_ENTRY)
+#undef SIMULATED_ENTRY
     library->symbols_.push_back(Symbol{"DllMain", reinterpret_cast<void*>(&DllMain)});
     return library;
 }
 
-}  // namespace sorvel::testhost
+}  // namespace sorvel::simulated

@@ -10,7 +10,7 @@
 #include <cstdlib>
 
 #include "collections/memory.hpp"
-#include "test_host.hpp"
+#include "simulated_host.hpp"
 
 #if defined(_WIN32)
 #ifndef WIN32_LEAN_AND_MEAN
@@ -23,7 +23,7 @@
 #include <unordered_set>
 #endif
 
-namespace sorvel::testhost::counting {
+namespace sorvel::test::counting {
 namespace {
 
 std::size_t g_live = 0;  // the seam's blocks
@@ -179,19 +179,19 @@ bool reroute(void*) {
 }  // a shared object's allocations stay out of reach
 #endif
 
-// Tells the test host about the counter as the program starts.
-const Library::Counter kCounter{{&live, &fail_after, &total}, &reroute};
-[[maybe_unused]] const bool g_installed = (Library::use_counter(&kCounter), true);
+// Tells the simulated host about the counter as the program starts.
+const simulated::Library::Counter kCounter{{&live, &fail_after, &total}, &reroute};
+[[maybe_unused]] const bool g_installed = (simulated::Library::use_counter(&kCounter), true);
 
 }  // namespace
-}  // namespace sorvel::testhost::counting
+}  // namespace sorvel::test::counting
 
 // The library's allocation seam, in place of the product's: the archive's
 // memory object is never linked into a program that links this one.
 namespace sorvel::memory {
 
 void* allocate(std::size_t bytes) noexcept {
-    using namespace testhost::counting;
+    using namespace test::counting;
     if (fails()) {
         return nullptr;
     }
@@ -202,7 +202,7 @@ void* allocate(std::size_t bytes) noexcept {
 
 void release(void* block) noexcept {
     if (block != nullptr) {
-        --testhost::counting::g_live;
+        --test::counting::g_live;
         std::free(block);
     }
 }

@@ -16,6 +16,8 @@
 // draws a few values itself, finds where they stand in the learnt sequence
 // (that position is the number of draws the library made) and seeds again
 // and draws up to that position, which leaves the generator as it found it.
+#include "draws.hpp"
+
 #include <cstddef>
 #include <cstdint>
 #include <cstdlib>
@@ -23,17 +25,15 @@
 #include <string>
 #include <vector>
 
-#include "test_host.hpp"
-
-namespace sorvel::testhost::draws {
+namespace sorvel::test::draws {
 namespace {
 constexpr int kMask = 0x7FFF;
 }  // namespace
-}  // namespace sorvel::testhost::draws
+}  // namespace sorvel::test::draws
 
 #if !defined(_WIN32)
 
-namespace sorvel::testhost::draws {
+namespace sorvel::test::draws {
 namespace {
 
 constexpr std::uint64_t state_for(unsigned seed) {
@@ -90,15 +90,15 @@ int next_value() {
     return generate(g_state);
 }
 
-}  // namespace sorvel::testhost::draws
+}  // namespace sorvel::test::draws
 
 extern "C" int rand() noexcept {
-    return sorvel::testhost::draws::next_value();
+    return sorvel::test::draws::next_value();
 }
 
 #else
 
-namespace sorvel::testhost::draws {
+namespace sorvel::test::draws {
 namespace {
 
 constexpr std::size_t kMargin = 4096;  // draws the library may make beyond those asked for
@@ -157,6 +157,6 @@ std::size_t made() {
                              " draws since reseed, or the generator was seeded elsewhere");
 }
 
-}  // namespace sorvel::testhost::draws
+}  // namespace sorvel::test::draws
 
 #endif

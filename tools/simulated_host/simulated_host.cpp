@@ -1,5 +1,5 @@
-// The test host: loading, calling, the host routines and the records.
-#include "test_host.hpp"
+// The simulated host: loading, calling, the host routines and the records.
+#include "simulated_host.hpp"
 
 #include <algorithm>
 #include <bit>
@@ -35,13 +35,13 @@
 // stdcall_check_i386.S: calls fn with count words pushed right to left and
 // stores in *delta how far the stack pointer moved across the call (0 when
 // the callee removed exactly its arguments). The stack is restored either way.
-extern "C" sorvel::testhost::word sorvel_testhost_stdcall_call(void* fn, const sorvel::testhost::word* args,
-                                                               sorvel::testhost::word count,
-                                                               sorvel::testhost::word* delta);
-#define TESTHOST_CHECKED_CALLS 1
+extern "C" sorvel::simulated::word sorvel_simulated_host_stdcall_call(void* fn, const sorvel::simulated::word* args,
+                                                                      sorvel::simulated::word count,
+                                                                      sorvel::simulated::word* delta);
+#define SIMULATED_CHECKED_CALLS 1
 #endif
 
-namespace sorvel::testhost {
+namespace sorvel::simulated {
 namespace {
 
 std::size_t g_stack_errors = 0;
@@ -264,9 +264,10 @@ word Library::call(void* function, std::initializer_list<word> args) const {
     if (args.size() > 7) {
         throw std::invalid_argument("at most 7 words");
     }
-#if defined(TESTHOST_CHECKED_CALLS)
+#if defined(SIMULATED_CHECKED_CALLS)
     word delta = 0;
-    const word result = sorvel_testhost_stdcall_call(function, args.begin(), static_cast<word>(args.size()), &delta);
+    const word result =
+        sorvel_simulated_host_stdcall_call(function, args.begin(), static_cast<word>(args.size()), &delta);
     if (delta != 0) {
         ++g_stack_errors;
     }
@@ -774,4 +775,4 @@ float Host::float_bits(word result) {
     return std::bit_cast<float>(static_cast<std::uint32_t>(static_cast<std::uintptr_t>(result)));
 }
 
-}  // namespace sorvel::testhost
+}  // namespace sorvel::simulated
