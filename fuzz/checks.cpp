@@ -113,14 +113,15 @@ void Session::check_created(Subject& s, const Options& o) {
     if (s.reader == 0) {
         mismatch("no ParamReader after CreateRunObject");
     }
-    for (int c = 0; c < 3; ++c) {
-        s.indexes[static_cast<std::size_t>(c)] = h.index(c);
-        if ((h.index(c) != 0) != (o.index_word == 1)) {
-            mismatch("index " + std::to_string(c) + " present: " + std::to_string(h.index(c) != 0) + ", option word " +
-                     std::to_string(o.index_word));
+    for (const Set set : sorvel::simulated::kSets) {
+        const auto c = static_cast<std::size_t>(set);
+        s.indexes[c] = h.index(set);
+        if ((h.index(set) != 0) != (o.index_word == 1)) {
+            mismatch("index " + std::to_string(c) + " present: " + std::to_string(h.index(set) != 0) +
+                     ", option word " + std::to_string(o.index_word));
         }
-        expect_equal(h.count(c), 0, "count after creation");
-        expect_equal(h.root(c), word{0}, "root after creation");
+        expect_equal(h.count(set), 0, "count after creation");
+        expect_equal(h.root(set), word{0}, "root after creation");
     }
     expect_equal(h.result_flags(), std::uint16_t{0}, "result flags after creation");
     host_.clear_calls();
@@ -146,8 +147,8 @@ void Session::check_header(const Subject& s) {
     expect_equal(s.host->pointer(RecordLayout::kReader), s.reader, "ParamReader pointer");
     expect_equal(s.host->i32(RecordLayout::kCaseSensitive), s.model->case_word(), "case-sensitive flag");
     expect_equal(s.host->i32(RecordLayout::kUseIndices), s.model->index_word(), "use-indices flag");
-    for (int c = 0; c < 3; ++c) {
-        expect_equal(s.host->index(c), s.indexes[static_cast<std::size_t>(c)], "index pointer");
+    for (const Set set : sorvel::simulated::kSets) {
+        expect_equal(s.host->index(set), s.indexes[static_cast<std::size_t>(set)], "index pointer");
     }
 }
 
@@ -203,52 +204,52 @@ std::uint16_t Session::prepare(Subject& s, std::vector<int> script) {
 }
 
 void Session::finish(Subject& s, std::uint16_t flags_before, std::uint16_t flags_added, std::size_t draws_used,
-                     int touched) {
+                     std::optional<Set> touched) {
     expect_equal(s.host->result_flags(), static_cast<std::uint16_t>(flags_before | flags_added), "result flags");
     expect_equal(draws::made(), draws_used, "draws made");
-    for (int c = 0; c < 3; ++c) {
+    for (const Set set : sorvel::simulated::kSets) {
         static constexpr std::array<const char*, 3> kCounts = {"integer count", "float count", "string count"};
-        expect_equal(s.host->count(c), count_of(*s.model, c), kCounts[static_cast<std::size_t>(c)]);
+        expect_equal(s.host->count(set), count_of(*s.model, set), kCounts[static_cast<std::size_t>(set)]);
     }
     check_header(s);
     // Whole trees are compared on a schedule (and at the end of every
     // input): results, counts, calls and draws already show most faults
     // at once, and a walk per event would cost more than the event.
-    if (touched >= 0 && event_number_ % kTreeEvery == 0) {
-        compare_tree(s, touched);
+    if (touched && event_number_ % kTreeEvery == 0) {
+        compare_tree(s, *touched);
     }
     // The side structure and the index after every change of a small
     // collection, and every few changes of a larger one: a broken
     // invariant shows within a few events, at a bounded cost per event.
-    if (touched >= 0 && (count_of(*s.model, touched) <= kInspectSmall || ++changes_ % kInspectEvery == 0)) {
-        check_invariants(s, touched);
+    if (touched && (count_of(*s.model, *touched) <= kInspectSmall || ++changes_ % kInspectEvery == 0)) {
+        check_invariants(s, *touched);
     }
 }
 
-void Session::compare_tree(Subject& s, int collection) {
+void Session::compare_tree(Subject& s, Set set) {
     const fuzzmodel::Instance& m = *s.model;
-    const word root = s.host->root(collection);
+    const word root = s.host->root(set);
     const std::optional<int> at =
-        collection == kIntegers
+        set == Set::integers
             ? difference(root, m.integers(), [](NodeView n, std::int32_t v) { return n.integer() == v; })
-        : collection == kFloats
+        : set == Set::floats
             ? difference(root, m.floats(),
                          [](NodeView n, float v) {
                              return std::bit_cast<std::uint32_t>(n.floating()) == std::bit_cast<std::uint32_t>(v);
                          })
             : tree_difference(root, m.strings());
     if (at) {
-        mismatch("collection " + std::to_string(collection) + ": the trees differ at model node " +
-                 std::to_string(*at) + " (" + std::to_string(count_of(m, collection)) + " nodes)");
+        mismatch("collection " + std::to_string(static_cast<int>(set)) + ": the trees differ at model node " +
+                 std::to_string(*at) + " (" + std::to_string(count_of(m, set)) + " nodes)");
     }
 }
 
-void Session::check_invariants(Subject& s, int collection) {
+void Session::check_invariants(Subject& s, Set set) {
     if (!inspect_) {
         return;
     }
     const std::string fault =
-        sorvel::test::check_collection(*reinterpret_cast<const sorvel::RunRecord*>(s.host->record()), collection);
+        sorvel::test::check_collection(*reinterpret_cast<const sorvel::RunRecord*>(s.host->record()), set);
     if (!fault.empty()) {
         mismatch("invariant broken: " + fault);
     }

@@ -14,12 +14,13 @@ constexpr std::size_t kMaxSweeps = 2;  // per input, besides the final one
 
 }  // namespace
 
-std::int32_t count_of(const fuzzmodel::Instance& m, int collection) {
-    switch (collection) {
-        case kIntegers: return m.integers_size();
-        case kFloats: return m.floats_size();
-        default: return m.strings_size();
+std::int32_t count_of(const fuzzmodel::Instance& m, Set set) {
+    switch (set) {
+        case Set::integers: return m.integers_size();
+        case Set::floats: return m.floats_size();
+        case Set::strings: return m.strings_size();
     }
+    return 0;
 }
 
 Options Decoder::options() {
@@ -72,9 +73,9 @@ bool Decoder::next(const std::vector<const fuzzmodel::Instance*>& models, Event&
     } else if (kind == 27) {
         const std::uint8_t head = in_.byte();
         walk_.instance = out.instance;
-        walk_.collection = head % 3;
+        walk_.set = static_cast<Set>(head % 3);
         walk_.position =
-            static_cast<std::int32_t>(in_.byte() % (static_cast<unsigned>(count_of(m, walk_.collection)) + 2U)) - 1;
+            static_cast<std::int32_t>(in_.byte() % (static_cast<unsigned>(count_of(m, walk_.set)) + 2U)) - 1;
         walk_.last.reset();
         walk_.removed.reset();
         walk_.steps = 3 + (head >> 2) % 14;
@@ -138,33 +139,33 @@ void Decoder::expression(Event& out, const fuzzmodel::Instance& m, std::size_t n
     out.number = number;
     out.param_word = values_.param_word();
     switch (number) {
-        case 1: out.draws = values_.draws(m.height(kIntegers) + 1); break;
-        case 3: out.draws = values_.draws(m.height(kFloats) + 1); break;
-        case 5: out.draws = values_.draws(m.height(kStrings) + 1); break;
+        case 1: out.draws = values_.draws(m.height(Set::integers) + 1); break;
+        case 3: out.draws = values_.draws(m.height(Set::floats) + 1); break;
+        case 5: out.draws = values_.draws(m.height(Set::strings) + 1); break;
         case 6: out.integer = values_.integer(); break;
         case 8: out.bits = values_.float_bits(); break;
         case 10: out.text = values_.text(); break;
         case 7:
         case 9:
         case 11: {
-            const int c = static_cast<int>(number - 7) / 2;
-            out.integer = values_.position(count_of(m, c));
-            remember_read(m, c, *out.integer);
+            const auto set = static_cast<Set>((number - 7) / 2);
+            out.integer = values_.position(count_of(m, set));
+            remember_read(m, set, *out.integer);
             break;
         }
         default: break;  // the sizes
     }
 }
 
-std::optional<Decoder::Held> Decoder::held_at(const fuzzmodel::Instance& m, int c, std::int32_t p) {
-    if (p < 0 || p >= count_of(m, c)) {
+std::optional<Decoder::Held> Decoder::held_at(const fuzzmodel::Instance& m, Set set, std::int32_t p) {
+    if (p < 0 || p >= count_of(m, set)) {
         return std::nullopt;
     }
     Held v;
-    switch (c) {
-        case kIntegers: v.integer = m.integer_at(p); break;
-        case kFloats: v.bits = std::bit_cast<std::uint32_t>(m.float_at(p)); break;
-        default: v.text = m.string_at(p); break;
+    switch (set) {
+        case Set::integers: v.integer = m.integer_at(p); break;
+        case Set::floats: v.bits = std::bit_cast<std::uint32_t>(m.float_at(p)); break;
+        case Set::strings: v.text = m.string_at(p); break;
     }
     return v;
 }
@@ -172,23 +173,23 @@ std::optional<Decoder::Held> Decoder::held_at(const fuzzmodel::Instance& m, int 
 // The read of a walk: ElementAt, with the position as the parameter word.
 void Decoder::read(const fuzzmodel::Instance& m, Event& out, std::int32_t position) {
     out.kind = Event::Kind::expression;
-    out.number = 7 + 2 * static_cast<std::size_t>(walk_.collection);
+    out.number = 7 + 2 * static_cast<std::size_t>(walk_.set);
     out.integer = position;
     out.param_word = position;
-    if (std::optional<Held> v = remember_read(m, walk_.collection, position)) {
+    if (std::optional<Held> v = remember_read(m, walk_.set, position)) {
         walk_.last = std::move(v);
     }
 }
 
 // What a read by position gives joins the values later events pick, and
 // later positions gather around it.
-std::optional<Decoder::Held> Decoder::remember_read(const fuzzmodel::Instance& m, int c, std::int32_t position) {
-    std::optional<Held> v = held_at(m, c, position);
+std::optional<Decoder::Held> Decoder::remember_read(const fuzzmodel::Instance& m, Set set, std::int32_t position) {
+    std::optional<Held> v = held_at(m, set, position);
     if (v) {
         values_.read_at(position);
-        if (c == kIntegers) {
+        if (set == Set::integers) {
             values_.met(v->integer);
-        } else if (c == kFloats) {
+        } else if (set == Set::floats) {
             values_.met(std::bit_cast<float>(v->bits));
         } else {
             values_.met(*v->text);
@@ -198,20 +199,20 @@ std::optional<Decoder::Held> Decoder::remember_read(const fuzzmodel::Instance& m
 }
 
 void Decoder::with_value(Event& out, const Held& v) const {
-    switch (walk_.collection) {
-        case kIntegers: out.integer = v.integer; break;
-        case kFloats: out.bits = v.bits; break;
-        default: out.text = v.text; break;
+    switch (walk_.set) {
+        case Set::integers: out.integer = v.integer; break;
+        case Set::floats: out.bits = v.bits; break;
+        case Set::strings: out.text = v.text; break;
     }
 }
 
 // One step of a walk; false when the step has nothing to do.
 bool Decoder::walk_step(const fuzzmodel::Instance& m, Event& out) {
     --walk_.steps;
-    const int c = walk_.collection;
-    const auto c_number = static_cast<std::size_t>(c);
+    const Set set = walk_.set;
+    const auto c_number = static_cast<std::size_t>(set);
     std::int32_t& p = walk_.position;
-    p = std::clamp(p, std::int32_t{-1}, count_of(m, c));
+    p = std::clamp(p, std::int32_t{-1}, count_of(m, set));
     out.instance = walk_.instance;
     const std::uint8_t op = in_.byte();
     switch (op % 8) {
@@ -253,7 +254,7 @@ bool Decoder::walk_step(const fuzzmodel::Instance& m, Event& out) {
             with_value(out, walk_.removed ? *walk_.removed : *walk_.last);
             return true;
         default:  // unread: the value at the position, or one the walk has passed
-            if (std::optional<Held> v = held_at(m, c, p - (op >> 3) % 4)) {
+            if (std::optional<Held> v = held_at(m, set, p - (op >> 3) % 4)) {
                 out.kind = Event::Kind::action;
                 out.number = 3 * c_number + 1;
                 with_value(out, *v);

@@ -31,12 +31,9 @@
 
 namespace fuzzdriver {
 
-// Collections, in the order of the run record and the model.
-inline constexpr int kIntegers = 0;
-inline constexpr int kFloats = 1;
-inline constexpr int kStrings = 2;
+using sorvel::simulated::Set;
 
-std::int32_t count_of(const fuzzmodel::Instance& m, int collection);
+std::int32_t count_of(const fuzzmodel::Instance& m, Set set);
 
 // The words of a new instance: its two options and the creation words.
 struct Options {
@@ -95,7 +92,7 @@ private:
     struct Walk {
         std::size_t steps = 0;  // left
         std::size_t instance = 0;
-        int collection = 0;
+        Set set = Set::integers;
         std::int32_t position = 0;
         std::optional<Held> last;     // read last
         std::optional<Held> removed;  // removed last
@@ -107,8 +104,8 @@ private:
     bool walk_step(const fuzzmodel::Instance& m, Event& out);
     void read(const fuzzmodel::Instance& m, Event& out, std::int32_t position);
     void with_value(Event& out, const Held& v) const;
-    std::optional<Held> remember_read(const fuzzmodel::Instance& m, int c, std::int32_t position);
-    static std::optional<Held> held_at(const fuzzmodel::Instance& m, int c, std::int32_t p);
+    std::optional<Held> remember_read(const fuzzmodel::Instance& m, Set set, std::int32_t position);
+    static std::optional<Held> held_at(const fuzzmodel::Instance& m, Set set, std::int32_t p);
 
     Input in_;
     Values values_;

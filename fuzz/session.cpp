@@ -127,9 +127,9 @@ void Session::run() {
     }
     event_number_ = Decoder::kMaxEvents;
     for (Subject& s : subjects_) {
-        for (int c = 0; c < 3; ++c) {
-            compare_tree(s, c);
-            check_invariants(s, c);
+        for (const Set set : sorvel::simulated::kSets) {
+            compare_tree(s, set);
+            check_invariants(s, set);
         }
         sweep(s);
     }
@@ -168,14 +168,14 @@ void Session::run_event(const Event& e) {
         case Event::Kind::sweep: sweep(s); break;
         case Event::Kind::compare:
             for (Subject& each : subjects_) {
-                for (int c = 0; c < 3; ++c) {
-                    compare_tree(each, c);
+                for (const Set set : sorvel::simulated::kSets) {
+                    compare_tree(each, set);
                 }
             }
             break;
         case Event::Kind::recreate:
-            for (int c = 0; c < 3; ++c) {
-                compare_tree(s, c);
+            for (const Set set : sorvel::simulated::kSets) {
+                compare_tree(s, set);
             }
             begin(s, {.name = "DestroyRunObject, then a new instance in its place"});
             host_.destroy(*s.host);
@@ -214,7 +214,7 @@ void Session::condition(Subject& s, const Event& e) {
     expect_equal(got, static_cast<word>(want ? 1 : 0), "condition result");
     calls_.assign(1, call);
     check_calls(calls_);
-    finish(s, flags, 0, 0, -1);
+    finish(s, flags, 0, 0, std::nullopt);
 }
 
 void Session::action(Subject& s, const Event& e) {
@@ -236,7 +236,7 @@ void Session::action(Subject& s, const Event& e) {
                    .bits = e.bits,
                    .text = e.text,
                    .failing = failing};
-    const int touched = number < 9 ? static_cast<int>(number / 3) : kStrings;
+    const Set touched = number < 9 ? static_cast<Set>(number / 3) : Set::strings;
     const bool adds = number % 3 == 0;
     fuzzmodel::Draws model_draws({});
     std::optional<bool> opens;  // for Load From File: whether the file opens
@@ -346,8 +346,8 @@ std::size_t Session::outcome_of_failing_load(Subject& s, const fuzzmodel::Instan
     // meet on their way down. The index is read once, when a tree matches.
     std::optional<std::vector<std::string>> index;
     const auto matches = [&](const fuzzmodel::Instance& m, std::size_t used) {
-        if (used != made || m.strings_size() != s.host->count(kStrings) ||
-            tree_difference(s.host->root(kStrings), m.strings())) {
+        if (used != made || m.strings_size() != s.host->count(Set::strings) ||
+            tree_difference(s.host->root(Set::strings), m.strings())) {
             return false;
         }
         if (!index) {
@@ -376,7 +376,7 @@ std::size_t Session::outcome_of_failing_load(Subject& s, const fuzzmodel::Instan
     mismatch(
         "the strings after a load with a failing allocation match no outcome: neither the full load, "
         "nor none, nor one line left out (library drew " +
-        std::to_string(made) + " times, holds " + std::to_string(s.host->count(kStrings)) + " strings)");
+        std::to_string(made) + " times, holds " + std::to_string(s.host->count(Set::strings)) + " strings)");
 }
 
 // The string index read back through StringElementAt$; the result flags
@@ -384,7 +384,8 @@ std::size_t Session::outcome_of_failing_load(Subject& s, const fuzzmodel::Instan
 std::vector<std::string> Session::library_index(Subject& s) {
     std::vector<std::string> out;
     const std::uint16_t flags = s.host->result_flags();
-    for (std::int32_t p = 0; s.indexes[kStrings] != 0 && p < s.host->count(kStrings); ++p) {
+    for (std::int32_t p = 0; s.indexes[static_cast<std::size_t>(Set::strings)] != 0 && p < s.host->count(Set::strings);
+         ++p) {
         out.push_back(Host::text_at(host_.expression(*s.host, 11, {Param::of(p)}, 0)));
     }
     s.host->set_result_flags(flags);
@@ -465,13 +466,13 @@ void Session::expression(Subject& s, std::size_t number, std::optional<std::int3
     switch (kind) {
         case Result::integer:
             expect_equal(static_cast<std::int32_t>(low), want_integer, "integer result");
-            finish(s, flags, 0, model_draws.used(), -1);
+            finish(s, flags, 0, model_draws.used(), std::nullopt);
             break;
         case Result::floating:
             if (low != want_float) {
                 mismatch("float result: library " + show_float(low) + ", model " + show_float(want_float));
             }
-            finish(s, flags, kFloatFlag, model_draws.used(), -1);
+            finish(s, flags, kFloatFlag, model_draws.used(), std::nullopt);
             break;
         case Result::text:
             // A host that gave no buffer gets an empty string of the library's own.
@@ -482,7 +483,7 @@ void Session::expression(Subject& s, std::size_t number, std::optional<std::int3
             if (const std::string text = Host::text_at(got); text != want_text) {
                 mismatch("string result: library " + show(text) + ", model " + show(want_text));
             }
-            finish(s, flags, kStringFlag, model_draws.used(), -1);
+            finish(s, flags, kStringFlag, model_draws.used(), std::nullopt);
             break;
     }
 }

@@ -77,9 +77,10 @@ private:
     void check_header(const Subject& s);
     void check_calls(const std::vector<ExpectedCall>& expected);
     std::uint16_t prepare(Subject& s, std::vector<int> script);
-    void finish(Subject& s, std::uint16_t flags_before, std::uint16_t flags_added, std::size_t draws_used, int touched);
-    void compare_tree(Subject& s, int collection);
-    void check_invariants(Subject& s, int collection);
+    void finish(Subject& s, std::uint16_t flags_before, std::uint16_t flags_added, std::size_t draws_used,
+                std::optional<Set> touched);
+    void compare_tree(Subject& s, Set set);
+    void check_invariants(Subject& s, Set set);
 
     Decoder decoder_;
     sorvel::simulated::Host host_;

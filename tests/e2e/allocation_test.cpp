@@ -29,13 +29,14 @@ using sorvel::simulated::Instance;
 using sorvel::simulated::Library;
 using sorvel::simulated::NodeView;
 using sorvel::simulated::Param;
+using sorvel::simulated::Set;
 using sorvel::simulated::word;
 
 // The strings in order and both counts: all a failure may change.
 std::string contents(Instance& instance) {
-    return std::to_string(instance.count(0)) + "/" + std::to_string(instance.count(2)) + ":" +
+    return std::to_string(instance.count(Set::integers)) + "/" + std::to_string(instance.count(Set::strings)) + ":" +
            sorvel::test::preorder(
-               instance.root(2), word{0},
+               instance.root(Set::strings), word{0},
                [](word n) {
                    return std::pair{NodeView{n}.left().address, NodeView{n}.right().address};
                },

@@ -4,6 +4,7 @@
 // creation, and real files through the system.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <array>
 #include <filesystem>
 #include <fstream>
@@ -25,6 +26,7 @@ using sorvel::simulated::Instance;
 using sorvel::simulated::Library;
 using sorvel::simulated::Param;
 using sorvel::simulated::RecordLayout;
+using sorvel::simulated::Set;
 using sorvel::simulated::word;
 using Routine = HostCall::Routine;
 namespace catalogue = sorvel::catalogue;
@@ -103,9 +105,11 @@ TEST(Creation, WithoutMemoryEveryEventStillWorks) {
         host.action(instance, 0, {Param::of(std::int32_t{4})});
         host.action(instance, 6, {Param::of("x")});
         EXPECT_EQ(host.condition(instance, 0, {Param::of(std::int32_t{4})}), 1) << failing;
-        EXPECT_EQ(host.expression(instance, 7, {Param::of(std::int32_t{0})}), instance.index(0) != 0 ? 4 : 0);
+        EXPECT_EQ(host.expression(instance, 7, {Param::of(std::int32_t{0})}),
+                  instance.index(Set::integers) != 0 ? 4 : 0);
         EXPECT_EQ(Host::text_at(host.expression(instance, 5)), "x");
-        const int indexes = (instance.index(0) != 0) + (instance.index(1) != 0) + (instance.index(2) != 0);
+        const auto indexes = std::count_if(sorvel::simulated::kSets.begin(), sorvel::simulated::kSets.end(),
+                                           [&](Set set) { return instance.index(set) != 0; });
         EXPECT_TRUE(indexes == 0 || indexes == 3) << "all three indexes or none";
         host.destroy(instance);
         EXPECT_EQ(allocations->live(), live) << "allocation " << failing << " failing";
@@ -146,7 +150,7 @@ TEST_F(Files, MissingFilesDirectoriesAndShortReads) {
         host.overstate_file_size(c.overstated);
         host.action(instance, 9, {Param::of(c.name), Param::of(std::int32_t{0})});
         host.overstate_file_size(0);
-        EXPECT_EQ(instance.count(2), c.strings);
+        EXPECT_EQ(instance.count(Set::strings), c.strings);
         EXPECT_EQ(host.open_handles(), 0U);
         if (c.strings == 3) {  // only what the read gave, never bytes beyond it
             EXPECT_EQ(Host::text_at(host.expression(instance, 11, {Param::of(std::int32_t{2})})), "three");

@@ -15,6 +15,7 @@
 
 #include "collections/collections.hpp"
 #include "host/boundary.hpp"
+#include "simulated_host.hpp"
 
 namespace sorvel::test {
 
@@ -142,25 +143,26 @@ std::string check_collection(Node* const* root, std::int32_t count, const SideSt
 }
 
 // One collection of an instance of the library linked in (the layouts are
-// this program's own): 0 integers, 1 floats, 2 strings.
-inline std::string check_collection(const RunRecord& r, int collection) {
+// this program's own).
+inline std::string check_collection(const RunRecord& r, simulated::Set set) {
     if (r.reader == nullptr) {
         return {};
     }
     const SideStructures& side = reinterpret_cast<const InstanceBlock*>(r.reader)->side;
     std::string fault;
-    switch (collection) {
-        case 0:
+    switch (set) {
+        case simulated::Set::integers:
             fault = check_collection(&r.integer_root, r.integer_count, &side.integers, r.integer_index, IntegerOrder{});
             return fault.empty() ? fault : "integers: " + fault;
-        case 1:
+        case simulated::Set::floats:
             fault = check_collection(&r.float_root, r.float_count, &side.floats, r.float_index, FloatOrder{});
             return fault.empty() ? fault : "floats: " + fault;
-        default:
+        case simulated::Set::strings:
             fault = check_collection(&r.string_root, r.string_count, &side.strings, r.string_index,
                                      StringOrder{r.case_sensitive == 1});
             return fault.empty() ? fault : "strings: " + fault;
     }
+    return {};
 }
 
 }  // namespace sorvel::test

@@ -328,8 +328,9 @@ void Instance::remove_string(const Text& v) {
     tree_remove(strings_, *s, indexed(), string_order());
 }
 
-void Instance::clear(int collection) {
-    collection == 0 ? tree_clear(integers_) : collection == 1 ? tree_clear(floats_) : tree_clear(strings_);
+void Instance::clear(sorvel::simulated::Set set) {
+    using enum sorvel::simulated::Set;
+    set == integers ? tree_clear(integers_) : set == floats ? tree_clear(floats_) : tree_clear(strings_);
 }
 
 void Instance::load(const std::optional<std::string>& file, std::int32_t balance, Draws& draws,
@@ -408,12 +409,9 @@ std::string Instance::string_at(std::int32_t position) const {
     return node == nullptr ? std::string() : node->value;
 }
 
-std::size_t Instance::height(int collection) const {
-    switch (collection) {
-        case 0: return tree_height(integers_);
-        case 1: return tree_height(floats_);
-        default: return tree_height(strings_);
-    }
+std::size_t Instance::height(sorvel::simulated::Set set) const {
+    using enum sorvel::simulated::Set;
+    return set == integers ? tree_height(integers_) : set == floats ? tree_height(floats_) : tree_height(strings_);
 }
 
 std::vector<std::string> split_lines(const std::string& bytes) {

@@ -13,6 +13,8 @@
 #include <utility>
 #include <vector>
 
+#include "simulated_host.hpp"
+
 namespace fuzzmodel {
 
 // Scripted draws of the runtime generator, in the order they are used.
@@ -85,7 +87,7 @@ public:
     void remove_float(float v);
     void add_string(const Text& v);
     void remove_string(const Text& v);
-    void clear(int collection);  // 0 integers, 1 floats, 2 strings
+    void clear(sorvel::simulated::Set set);
     // `file` is the file's bytes, or nullopt when it cannot be opened.
     // `left_out`: the number (from 0) of a line whose add is left out, as
     // when memory runs out for that one line.
@@ -113,7 +115,7 @@ public:
 
     // Number of nodes on the longest root-to-leaf path (0 when empty), so a
     // caller knows how many draws a random element can need.
-    std::size_t height(int collection) const;  // 0 integers, 1 floats, 2 strings
+    std::size_t height(sorvel::simulated::Set set) const;
 
 private:
     std::int32_t case_word_;

@@ -357,32 +357,13 @@ void check_range(std::size_t offset, std::size_t width, std::size_t size) {
     }
 }
 
-std::size_t count_offset(int collection) {
-    switch (collection) {
-        case 0: return RecordLayout::kIntegerCount;
-        case 1: return RecordLayout::kFloatCount;
-        case 2: return RecordLayout::kStringCount;
-        default: throw std::invalid_argument("collection 0, 1 or 2");
-    }
-}
-
-std::size_t root_offset(int collection) {
-    switch (collection) {
-        case 0: return RecordLayout::kIntegerRoot;
-        case 1: return RecordLayout::kFloatRoot;
-        case 2: return RecordLayout::kStringRoot;
-        default: throw std::invalid_argument("collection 0, 1 or 2");
-    }
-}
-
-std::size_t index_offset(int collection) {
-    switch (collection) {
-        case 0: return RecordLayout::kIntegerIndex;
-        case 1: return RecordLayout::kFloatIndex;
-        case 2: return RecordLayout::kStringIndex;
-        default: throw std::invalid_argument("collection 0, 1 or 2");
-    }
-}
+// Count, root and index of each set, in the order of Set.
+constexpr std::array<std::size_t, 3> kCountAt{RecordLayout::kIntegerCount, RecordLayout::kFloatCount,
+                                              RecordLayout::kStringCount};
+constexpr std::array<std::size_t, 3> kRootAt{RecordLayout::kIntegerRoot, RecordLayout::kFloatRoot,
+                                             RecordLayout::kStringRoot};
+constexpr std::array<std::size_t, 3> kIndexAt{RecordLayout::kIntegerIndex, RecordLayout::kFloatIndex,
+                                              RecordLayout::kStringIndex};
 }  // namespace
 
 std::int32_t Instance::i32(std::size_t offset) const {
@@ -405,14 +386,14 @@ void Instance::set_result_flags(std::uint16_t flags) {
     std::memcpy(record_.data() + RecordLayout::kResultFlags, &flags, sizeof flags);
 }
 
-std::int32_t Instance::count(int collection) const {
-    return i32(count_offset(collection));
+std::int32_t Instance::count(Set set) const {
+    return i32(kCountAt[static_cast<std::size_t>(set)]);
 }
-word Instance::root(int collection) const {
-    return pointer(root_offset(collection));
+word Instance::root(Set set) const {
+    return pointer(kRootAt[static_cast<std::size_t>(set)]);
 }
-word Instance::index(int collection) const {
-    return pointer(index_offset(collection));
+word Instance::index(Set set) const {
+    return pointer(kIndexAt[static_cast<std::size_t>(set)]);
 }
 
 // ---------------------------------------------------------------- NodeView

@@ -24,6 +24,14 @@ namespace sorvel::simulated {
 
 using word = std::intptr_t;
 
+// The three ordered sets of an instance, in the run record's order.
+enum class Set : std::uint8_t { integers, floats, strings };
+inline constexpr std::array<Set, 3> kSets{Set::integers, Set::floats, Set::strings};
+inline constexpr std::array<const char*, 3> kSetNames{"integers", "floats", "strings"};
+constexpr const char* name(Set set) {
+    return kSetNames[static_cast<std::size_t>(set)];
+}
+
 // Byte offsets of the host records on this target.
 struct RecordLayout {
     static constexpr std::size_t kWord = sizeof(void*);
@@ -204,10 +212,9 @@ public:
     std::uint16_t result_flags() const { return u16(RecordLayout::kResultFlags); }
     void set_result_flags(std::uint16_t flags);
 
-    // Collections: 0 integers, 1 floats, 2 strings.
-    std::int32_t count(int collection) const;
-    word root(int collection) const;
-    word index(int collection) const;
+    std::int32_t count(Set set) const;
+    word root(Set set) const;
+    word index(Set set) const;
 
     // What CreateRunObject and DestroyRunObject gave.
     std::size_t size() const { return record_.size(); }

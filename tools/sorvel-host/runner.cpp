@@ -15,8 +15,7 @@ using simulated::Host;
 using simulated::HostCall;
 using simulated::NodeView;
 using simulated::Param;
-
-const char* const kCollectionNames[] = {"integers", "floats", "strings"};
+using simulated::Set;
 
 // Text trees stop here; deeper subtrees are summed up in one line.
 constexpr std::size_t kTextDepth = 32;
@@ -88,14 +87,14 @@ std::string hex(simulated::word w) {
     return text;
 }
 
-void write_dot_tree(std::ostream& dot, NodeView root, int collection, const std::string& id) {
+void write_dot_tree(std::ostream& dot, NodeView root, Set set, const std::string& id) {
     std::vector<NodeView> pending{root};
     std::size_t hidden = 0;
     while (!pending.empty()) {
         const NodeView node = pending.back();
         pending.pop_back();
         const std::string name = id + "_" + hex(node.address);
-        dot << "  \"" << name << "\" [label=" << quote(show_value(node, collection)) << "];\n";
+        dot << "  \"" << name << "\" [label=" << quote(show_value(node, set)) << "];\n";
         const NodeView children[] = {node.left(), node.right()};
         for (const NodeView& child : children) {
             if (child) {
@@ -130,12 +129,13 @@ std::string quote(const std::string& text) {
     return out + "\"";
 }
 
-std::string show_value(NodeView node, int collection) {
-    switch (collection) {
-        case 0: return std::to_string(node.integer());
-        case 1: return show_float(node.floating());
-        default: return node.string();
+std::string show_value(NodeView node, Set set) {
+    switch (set) {
+        case Set::integers: return std::to_string(node.integer());
+        case Set::floats: return show_float(node.floating());
+        case Set::strings: return node.string();
     }
+    return {};
 }
 
 TreeFacts tree_facts(NodeView root) {
@@ -214,7 +214,7 @@ bool Runner::execute(const std::string& line, const std::string& where) {
             }
             current_ = static_cast<std::size_t>(c.number - 1);
             break;
-        case Command::Type::tree: print_tree(c.collection, c.dot_file); break;
+        case Command::Type::tree: print_tree(c.set, c.dot_file); break;
         case Command::Type::seed: host_.library().seed_rand(static_cast<unsigned>(c.number)); break;
         case Command::Type::events:
             for (const catalogue::Event& e : catalogue::kEvents) {
@@ -285,10 +285,10 @@ void Runner::print_trace() {
     }
 }
 
-void Runner::print_tree(int collection, const std::string& dot_file) {
-    const NodeView root{instances_[current_]->root(collection)};
+void Runner::print_tree(Set set, const std::string& dot_file) {
+    const NodeView root{instances_[current_]->root(set)};
     const TreeFacts facts = tree_facts(root);
-    out_ << prefix() << kCollectionNames[collection] << ": " << facts.nodes << " nodes, depth " << facts.depth << "\n";
+    out_ << prefix() << simulated::name(set) << ": " << facts.nodes << " nodes, depth " << facts.depth << "\n";
     std::vector<std::tuple<NodeView, std::size_t, const char*>> pending;
     if (root) {
         pending.emplace_back(root, 0, "");
@@ -301,8 +301,8 @@ void Runner::print_tree(int collection, const std::string& dot_file) {
             out_ << indent << side << "... " << tree_facts(node).nodes << " more nodes below\n";
             continue;
         }
-        const std::string value = show_value(node, collection);
-        out_ << indent << side << (collection == 2 ? quote(value) : value) << "\n";
+        const std::string value = show_value(node, set);
+        out_ << indent << side << (set == Set::strings ? quote(value) : value) << "\n";
         if (node.right()) {
             pending.emplace_back(node.right(), level + 1, "R ");
         }
@@ -314,7 +314,7 @@ void Runner::print_tree(int collection, const std::string& dot_file) {
         std::ofstream dot(dot_file);
         dot << "digraph sorvel {\n  node [shape=box, fontname=\"Helvetica\"];\n";
         if (root) {
-            write_dot_tree(dot, root, collection, "t");
+            write_dot_tree(dot, root, set, "t");
         }
         dot << "}\n";
         if (!dot) {
@@ -327,16 +327,16 @@ bool Runner::write_dot(const std::string& path) {
     std::ofstream dot(path);
     dot << "digraph sorvel {\n  node [shape=box, fontname=\"Helvetica\"];\n";
     for (std::size_t i = 0; i < instances_.size(); ++i) {
-        for (int collection = 0; collection < 3; ++collection) {
-            const NodeView root{instances_[i]->root(collection)};
+        for (const Set set : simulated::kSets) {
+            const NodeView root{instances_[i]->root(set)};
             if (!root) {
                 continue;
             }
             const TreeFacts facts = tree_facts(root);
-            const std::string id = "i" + std::to_string(i + 1) + kCollectionNames[collection];
-            dot << " subgraph \"cluster_" << id << "\" {\n  label=\"instance " << i + 1 << ": "
-                << kCollectionNames[collection] << ", " << facts.nodes << " nodes, depth " << facts.depth << "\";\n";
-            write_dot_tree(dot, root, collection, id);
+            const std::string id = "i" + std::to_string(i + 1) + simulated::name(set);
+            dot << " subgraph \"cluster_" << id << "\" {\n  label=\"instance " << i + 1 << ": " << simulated::name(set)
+                << ", " << facts.nodes << " nodes, depth " << facts.depth << "\";\n";
+            write_dot_tree(dot, root, set, id);
             dot << " }\n";
         }
     }

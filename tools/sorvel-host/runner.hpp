@@ -40,7 +40,7 @@ public:
 
 private:
     void run_event(const Command& command, const std::string& where);
-    void print_tree(int collection, const std::string& dot_file);
+    void print_tree(simulated::Set set, const std::string& dot_file);
     void print_trace();
     std::string prefix() const;
 
@@ -63,7 +63,7 @@ TreeFacts tree_facts(simulated::NodeView root);
 
 // A value as the tool shows it: integers in decimal, floats as %g, strings
 // quoted with escapes for bytes that would not print.
-std::string show_value(simulated::NodeView node, int collection);
+std::string show_value(simulated::NodeView node, simulated::Set set);
 std::string quote(const std::string& text);
 
 }  // namespace sorvel::script

@@ -24,7 +24,9 @@ std::string lower(std::string_view s) {
     return out;
 }
 
-bool word_char(char c) { return std::isalnum(static_cast<unsigned char>(c)) != 0 || c == '_' || c == '$' || c == '.'; }
+bool word_char(char c) {
+    return std::isalnum(static_cast<unsigned char>(c)) != 0 || c == '_' || c == '$' || c == '.';
+}
 
 bool number_start(std::string_view s, std::size_t at) {
     auto digit = [&](std::size_t i) { return i < s.size() && std::isdigit(static_cast<unsigned char>(s[i])) != 0; };
@@ -35,7 +37,8 @@ bool number_start(std::string_view s, std::size_t at) {
         return true;
     }
     if ((s[at] == '-' || s[at] == '+') && at + 1 < s.size()) {
-        return digit(at + 1) || (s[at + 1] == '.' && digit(at + 2)) || std::isalpha(static_cast<unsigned char>(s[at + 1])) != 0;
+        return digit(at + 1) || (s[at + 1] == '.' && digit(at + 2)) ||
+               std::isalpha(static_cast<unsigned char>(s[at + 1])) != 0;
     }
     return false;
 }
@@ -104,7 +107,7 @@ bool tokenize(std::string_view line, std::vector<Token>& tokens, std::string& er
         if (number_start(line, i)) {
             const std::size_t start = i++;
             while (i < line.size() && (word_char(line[i]) || ((line[i] == '-' || line[i] == '+') &&
-                                                                (line[i - 1] == 'e' || line[i - 1] == 'E')))) {
+                                                              (line[i - 1] == 'e' || line[i - 1] == 'E')))) {
                 ++i;
             }
             tokens.push_back({Token::Kind::number, std::string(line.substr(start, i - start))});
@@ -168,7 +171,9 @@ bool parse_float(const std::string& text, float& out) {
     return end != text.c_str() && *end == '\0';
 }
 
-std::string describe(const catalogue::Event& e) { return "\"" + std::string(e.display) + "\""; }
+std::string describe(const catalogue::Event& e) {
+    return "\"" + std::string(e.display) + "\"";
+}
 
 std::size_t distance(std::string_view a, std::string_view b) {
     std::vector<std::size_t> row(b.size() + 1);
@@ -196,7 +201,9 @@ const char* kind_name(catalogue::Value v) {
     return "a value";
 }
 
-Parsed fail(std::string message) { return Parsed{std::nullopt, std::move(message)}; }
+Parsed fail(std::string message) {
+    return Parsed{std::nullopt, std::move(message)};
+}
 
 Parsed tool_command(const std::string& first, const std::vector<Token>& tokens) {
     Command c;
@@ -225,13 +232,13 @@ Parsed tool_command(const std::string& first, const std::vector<Token>& tokens) 
     }
     if (first == "tree") {
         c.type = Command::Type::tree;
-        static const char* const kinds[] = {"integers", "floats", "strings"};
+        const auto& kinds = simulated::kSetNames;
         const std::string kind = count >= 2 ? lower(tokens[1].text) : "";
-        const auto found = std::find_if(std::begin(kinds), std::end(kinds), [&](const char* k) { return kind == k; });
-        if (count < 2 || tokens[1].kind != Token::Kind::word || found == std::end(kinds)) {
+        const auto found = std::find_if(kinds.begin(), kinds.end(), [&](const char* k) { return kind == k; });
+        if (count < 2 || tokens[1].kind != Token::Kind::word || found == kinds.end()) {
             return fail("tree takes integers, floats or strings, then optionally a quoted DOT file name");
         }
-        c.collection = static_cast<int>(found - std::begin(kinds));
+        c.set = simulated::kSets[static_cast<std::size_t>(found - kinds.begin())];
         if (count == 3 && tokens[2].kind == Token::Kind::string) {
             c.dot_file = tokens[2].text;
         } else if (count != 2) {
@@ -240,7 +247,9 @@ Parsed tool_command(const std::string& first, const std::vector<Token>& tokens) 
         return {c, {}};
     }
     if (count == 1 && (first == "events" || first == "help" || first == "quit" || first == "exit")) {
-        c.type = first == "events" ? Command::Type::events : first == "help" ? Command::Type::help : Command::Type::quit;
+        c.type = first == "events" ? Command::Type::events
+                 : first == "help" ? Command::Type::help
+                                   : Command::Type::quit;
         return {c, {}};
     }
     return fail("");

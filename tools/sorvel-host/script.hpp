@@ -15,6 +15,7 @@
 #include <vector>
 
 #include "host/catalogue.hpp"
+#include "simulated_host.hpp"
 
 namespace sorvel::script {
 
@@ -29,11 +30,11 @@ struct Value {
 struct Command {
     enum class Type { nothing, event, instance, tree, seed, events, help, quit };
     Type type = Type::nothing;
-    const catalogue::Event* event = nullptr;  // for events
-    std::vector<Value> values;                 // event parameters, converted to their kinds
-    std::int64_t number = 0;                   // instance, seed
-    int collection = 0;                        // tree: 0 integers, 1 floats, 2 strings
-    std::string dot_file;                      // tree: also write DOT here
+    const catalogue::Event* event = nullptr;        // for events
+    std::vector<Value> values;                      // event parameters, converted to their kinds
+    std::int64_t number = 0;                        // instance, seed
+    simulated::Set set = simulated::Set::integers;  // tree
+    std::string dot_file;                           // tree: also write DOT here
 };
 
 struct Parsed {
