@@ -153,10 +153,25 @@ std::string events(const std::vector<std::string>& lines) {
         check(row[0] == kind_name(e.kind) && row[1] == display, "row " + std::to_string(i + 1) + " is " + row[0] + " " +
                                                                     row[1] + ", not " + kind_name(e.kind) + " " +
                                                                     display);
-        std::string titles;
+        // The parameters' kinds and the result, as the README words them.
+        static constexpr const char* kValueWords[] = {"integer", "float", "string"};
+        std::string titles, kinds;
         for (std::size_t p = 0; p < e.param_count; ++p) {
             titles += (p == 0 ? "" : ", ") + ("\"" + std::string(e.params[p].title) + "\"");
+            kinds += (p == 0 ? "" : ", ") + std::string(kValueWords[static_cast<int>(e.params[p].value)]);
         }
+        const std::string result = e.kind == cat::Kind::condition ? "true/false"
+                                   : e.kind == cat::Kind::action  ? "—"
+                                   : e.info == cat::kFloatResult  ? "float"
+                                   : e.info == cat::kStringResult ? "string"
+                                                                  : "integer";
+        // The README names two kinds by their use.
+        const std::string given = row[2] == "integer position"     ? "integer"
+                                  : row[2] == "file name, integer" ? "string, integer"
+                                                                   : row[2];
+        check(given == (kinds.empty() ? "—" : kinds) && row[3] == result,
+              "row " + std::to_string(i + 1) + " gives parameters " + row[2] + " and result " + row[3] + ", not " +
+                  kinds + " and " + result);
         items += std::string(kind_name(e.kind)) + " " + display + "\n";
         if (e.param_count != 0) {
             items += wrap("parameters: " + row[2] + " (asked as " + titles + ")");
