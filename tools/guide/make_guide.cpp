@@ -4,8 +4,8 @@
 // catalogue, in its order, with its display string and the titles the host
 // asks its parameters with; the README's row of the same event gives its
 // parameters, result and what it does. A README whose event or option table
-// does not pair with the catalogue row by row gets no guide (the unit test
-// Readme checks the rest of each row).
+// does not match the catalogue row by row (kind, display string, parameter
+// kinds, result) gets no guide, so that code and documentation cannot drift.
 //
 //   sorvel-guide README.md VERSION OUTPUT
 #include <cstdio>
