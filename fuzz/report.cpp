@@ -6,6 +6,8 @@
 #include <cstdlib>
 #include <utility>
 
+#include "runner.hpp"
+
 namespace fuzzdriver {
 namespace {
 
@@ -24,27 +26,11 @@ std::string hex32(std::uint32_t v) {
 }  // namespace
 
 std::string show(const Text& text) {
-    if (!text) {
-        return "(null)";
-    }
-    std::string out = "\"";
-    for (const char c : *text) {
-        const auto byte = static_cast<unsigned char>(c);
-        if (byte >= 0x20 && byte < 0x7F && byte != '"' && byte != '\\') {
-            out += c;
-        } else {
-            char esc[8];
-            std::snprintf(esc, sizeof esc, "\\x%02X", byte);
-            out += esc;
-        }
-    }
-    return out + "\"";
+    return text ? sorvel::script::quote(*text) : "(null)";
 }
 
 std::string show_float(std::uint32_t bits) {
-    char text[48];
-    std::snprintf(text, sizeof text, "%g[%s]", static_cast<double>(std::bit_cast<float>(bits)), hex32(bits).c_str());
-    return text;
+    return sorvel::script::show_float(std::bit_cast<float>(bits)) + "[" + hex32(bits) + "]";
 }
 
 // The display string with its placeholders filled in: "%o" is the object,

@@ -20,12 +20,6 @@ using simulated::Set;
 // Text trees stop here; deeper subtrees are summed up in one line.
 constexpr std::size_t kTextDepth = 32;
 
-std::string show_float(float v) {
-    char text[48];
-    std::snprintf(text, sizeof text, "%.9g", static_cast<double>(v));
-    return text;
-}
-
 Param to_param(const Value& v) {
     switch (v.kind) {
         case Value::Kind::integer: return Param::of(v.integer);
@@ -127,6 +121,12 @@ std::string quote(const std::string& text) {
         }
     }
     return out + "\"";
+}
+
+std::string show_float(float v) {
+    char text[48];
+    std::snprintf(text, sizeof text, "%.9g", static_cast<double>(v));
+    return text;
 }
 
 std::string show_value(NodeView node, Set set) {

@@ -65,5 +65,7 @@ TreeFacts tree_facts(simulated::NodeView root);
 // quoted with escapes for bytes that would not print.
 std::string show_value(simulated::NodeView node, simulated::Set set);
 std::string quote(const std::string& text);
+// A float in as many digits as tell it apart.
+std::string show_float(float v);
 
 }  // namespace sorvel::script
