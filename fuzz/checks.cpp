@@ -42,12 +42,12 @@ const char* routine_name(Routine r) {
 // Walks both trees side by side. Gives the model's node at which they
 // first differ (kNone: at a missing one), or nothing when they agree.
 template <class V, class Same>
-std::optional<int> difference(word root, const fuzzmodel::Collection<V>& c, Same same) {
+std::optional<int> difference(word root, const sorvel::test::model::Collection<V>& c, Same same) {
     std::vector<std::pair<word, int>> pending{{root, c.root}};
     while (!pending.empty()) {
         const auto [lib, mod] = pending.back();
         pending.pop_back();
-        if ((lib == 0) != (mod == fuzzmodel::kNone) || (lib != 0 && !same(NodeView{lib}, c.at(mod).value))) {
+        if ((lib == 0) != (mod == sorvel::test::model::kNone) || (lib != 0 && !same(NodeView{lib}, c.at(mod).value))) {
             return mod;
         }
         if (lib != 0) {
@@ -60,7 +60,7 @@ std::optional<int> difference(word root, const fuzzmodel::Collection<V>& c, Same
 
 }  // namespace
 
-std::optional<int> tree_difference(word root, const fuzzmodel::Collection<std::string>& c) {
+std::optional<int> tree_difference(word root, const sorvel::test::model::Collection<std::string>& c) {
     return difference(root, c, [](NodeView n, const std::string& v) { return n.string() == v; });
 }
 
@@ -227,7 +227,7 @@ void Session::finish(Subject& s, std::uint16_t flags_before, std::uint16_t flags
 }
 
 void Session::compare_tree(Subject& s, Set set) {
-    const fuzzmodel::Instance& m = *s.model;
+    const sorvel::test::model::Instance& m = *s.model;
     const word root = s.host->root(set);
     const std::optional<int> at =
         set == Set::integers

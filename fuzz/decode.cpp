@@ -14,7 +14,7 @@ constexpr std::size_t kMaxSweeps = 2;  // per input, besides the final one
 
 }  // namespace
 
-std::int32_t count_of(const fuzzmodel::Instance& m, Set set) {
+std::int32_t count_of(const sorvel::test::model::Instance& m, Set set) {
     switch (set) {
         case Set::integers: return m.integers_size();
         case Set::floats: return m.floats_size();
@@ -33,7 +33,7 @@ Options Decoder::options() {
     return o;
 }
 
-bool Decoder::next(const std::vector<const fuzzmodel::Instance*>& models, Event& out) {
+bool Decoder::next(const std::vector<const sorvel::test::model::Instance*>& models, Event& out) {
     out.integer.reset();
     out.bits.reset();
     out.text.reset();
@@ -55,7 +55,7 @@ bool Decoder::next(const std::vector<const fuzzmodel::Instance*>& models, Event&
     out.ordinal = events_++;
     const std::uint8_t op = in_.byte();
     out.instance = (op >> 5) % models.size();
-    const fuzzmodel::Instance& m = *models[out.instance];
+    const sorvel::test::model::Instance& m = *models[out.instance];
     const unsigned kind = op & 31U;
     if (kind < 3) {
         out.number = kind;
@@ -124,7 +124,7 @@ void Decoder::action(Event& out, std::size_t number, long failing) {
             out.file = which < 6 ? Event::File::written : which == 6 ? Event::File::missing : Event::File::none;
             if (out.file == Event::File::written) {
                 out.contents = values_.file();
-                out.lines = fuzzmodel::split_lines(out.contents).size();
+                out.lines = sorvel::test::model::split_lines(out.contents).size();
             }
             out.balance = values_.balance();
             out.draws = values_.draws(out.balance != 0 ? out.lines : 0);
@@ -134,7 +134,7 @@ void Decoder::action(Event& out, std::size_t number, long failing) {
     }
 }
 
-void Decoder::expression(Event& out, const fuzzmodel::Instance& m, std::size_t number) {
+void Decoder::expression(Event& out, const sorvel::test::model::Instance& m, std::size_t number) {
     out.kind = Event::Kind::expression;
     out.number = number;
     out.param_word = values_.param_word();
@@ -157,7 +157,7 @@ void Decoder::expression(Event& out, const fuzzmodel::Instance& m, std::size_t n
     }
 }
 
-std::optional<Decoder::Held> Decoder::held_at(const fuzzmodel::Instance& m, Set set, std::int32_t p) {
+std::optional<Decoder::Held> Decoder::held_at(const sorvel::test::model::Instance& m, Set set, std::int32_t p) {
     if (p < 0 || p >= count_of(m, set)) {
         return std::nullopt;
     }
@@ -171,7 +171,7 @@ std::optional<Decoder::Held> Decoder::held_at(const fuzzmodel::Instance& m, Set 
 }
 
 // The read of a walk: ElementAt, with the position as the parameter word.
-void Decoder::read(const fuzzmodel::Instance& m, Event& out, std::int32_t position) {
+void Decoder::read(const sorvel::test::model::Instance& m, Event& out, std::int32_t position) {
     out.kind = Event::Kind::expression;
     out.number = 7 + 2 * static_cast<std::size_t>(walk_.set);
     out.integer = position;
@@ -183,7 +183,8 @@ void Decoder::read(const fuzzmodel::Instance& m, Event& out, std::int32_t positi
 
 // What a read by position gives joins the values later events pick, and
 // later positions gather around it.
-std::optional<Decoder::Held> Decoder::remember_read(const fuzzmodel::Instance& m, Set set, std::int32_t position) {
+std::optional<Decoder::Held> Decoder::remember_read(const sorvel::test::model::Instance& m, Set set,
+                                                    std::int32_t position) {
     std::optional<Held> v = held_at(m, set, position);
     if (v) {
         values_.read_at(position);
@@ -207,7 +208,7 @@ void Decoder::with_value(Event& out, const Held& v) const {
 }
 
 // One step of a walk; false when the step has nothing to do.
-bool Decoder::walk_step(const fuzzmodel::Instance& m, Event& out) {
+bool Decoder::walk_step(const sorvel::test::model::Instance& m, Event& out) {
     --walk_.steps;
     const Set set = walk_.set;
     const auto c_number = static_cast<std::size_t>(set);

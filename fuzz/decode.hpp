@@ -33,7 +33,7 @@ namespace fuzzdriver {
 
 using sorvel::simulated::Set;
 
-std::int32_t count_of(const fuzzmodel::Instance& m, Set set);
+std::int32_t count_of(const sorvel::test::model::Instance& m, Set set);
 
 // The words of a new instance: its two options and the creation words.
 struct Options {
@@ -80,7 +80,7 @@ public:
 
     // The next event, decoded against the models of the instances as they
     // stand; false once the input or the budget of events is spent.
-    bool next(const std::vector<const fuzzmodel::Instance*>& models, Event& out);
+    bool next(const std::vector<const sorvel::test::model::Instance*>& models, Event& out);
 
 private:
     // A value read by a walk: the field of its collection's kind counts.
@@ -100,12 +100,12 @@ private:
 
     void condition(Event& out);
     void action(Event& out, std::size_t number, long failing);
-    void expression(Event& out, const fuzzmodel::Instance& m, std::size_t number);
-    bool walk_step(const fuzzmodel::Instance& m, Event& out);
-    void read(const fuzzmodel::Instance& m, Event& out, std::int32_t position);
+    void expression(Event& out, const sorvel::test::model::Instance& m, std::size_t number);
+    bool walk_step(const sorvel::test::model::Instance& m, Event& out);
+    void read(const sorvel::test::model::Instance& m, Event& out, std::int32_t position);
     void with_value(Event& out, const Held& v) const;
-    std::optional<Held> remember_read(const fuzzmodel::Instance& m, Set set, std::int32_t position);
-    static std::optional<Held> held_at(const fuzzmodel::Instance& m, Set set, std::int32_t p);
+    std::optional<Held> remember_read(const sorvel::test::model::Instance& m, Set set, std::int32_t position);
+    static std::optional<Held> held_at(const sorvel::test::model::Instance& m, Set set, std::int32_t p);
 
     Input in_;
     Values values_;

@@ -15,7 +15,7 @@
 
 namespace fuzzdriver {
 
-using Text = fuzzmodel::Instance::Text;
+using Text = sorvel::test::model::Instance::Text;
 
 // One event as it ran.
 struct Described {

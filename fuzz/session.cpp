@@ -92,7 +92,7 @@ ExpectedCall result_space(const Subject& s, const std::string& text) {
     return {Routine::alloc_result_string, {s.host->address(), word{0}, static_cast<word>(text.size() + 1)}};
 }
 
-std::vector<std::string> model_index(const fuzzmodel::Instance& m) {
+std::vector<std::string> model_index(const sorvel::test::model::Instance& m) {
     std::vector<std::string> out;
     for (const int slot : m.strings().index) {
         out.push_back(m.strings().at(slot).value);
@@ -114,7 +114,7 @@ void Session::run() {
         subjects_.emplace_back();
         create(subjects_.back(), static_cast<int>(i), decoder_.options());
     }
-    const auto models = [this]() -> const std::vector<const fuzzmodel::Instance*>& {
+    const auto models = [this]() -> const std::vector<const sorvel::test::model::Instance*>& {
         models_.clear();
         for (const Subject& s : subjects_) {
             models_.push_back(s.model.get());
@@ -153,7 +153,7 @@ void Session::begin(const Subject& s, Described what) const {
 
 void Session::create(Subject& s, int number, const Options& o) {
     s.number = number;
-    s.model = std::make_unique<fuzzmodel::Instance>(o.case_word, o.index_word);
+    s.model = std::make_unique<sorvel::test::model::Instance>(o.case_word, o.index_word);
     begin(s, {.name = "CreateRunObject"});
     s.host = &host_.create(o.case_word, o.index_word, o.creation8, o.creation12);
     check_created(s, o);
@@ -223,7 +223,7 @@ void Session::action(Subject& s, const Event& e) {
     if (number == 9 && e.lines > kMaxFailingLoadLines) {
         failing = -1;  // each outcome of a failing load is a model run: keep them few
     }
-    std::optional<fuzzmodel::Instance> before;
+    std::optional<sorvel::test::model::Instance> before;
     if (failing >= 0) {
         before.emplace(*s.model);
     }
@@ -238,7 +238,7 @@ void Session::action(Subject& s, const Event& e) {
                    .failing = failing};
     const Set touched = number < 9 ? static_cast<Set>(number / 3) : Set::strings;
     const bool adds = number % 3 == 0;
-    fuzzmodel::Draws model_draws({});
+    sorvel::test::model::Draws model_draws({});
     std::optional<bool> opens;  // for Load From File: whether the file opens
     switch (number) {
         case 2:
@@ -274,7 +274,7 @@ void Session::action(Subject& s, const Event& e) {
                 name = missing_path();
                 opens = false;
             }
-            model_draws = fuzzmodel::Draws(e.draws);
+            model_draws = sorvel::test::model::Draws(e.draws);
             s.model->load(opens == true ? std::optional(e.contents) : std::nullopt, e.balance, model_draws);
             what.integer = e.balance;
             what.text = opens == true ? Text(e.contents.substr(0, 96)) : name;
@@ -338,14 +338,14 @@ void Session::action(Subject& s, const Event& e) {
 // line's add left out and everything else done. The model takes the
 // outcome whose strings, shape and draws are the library's; none
 // matching is a mismatch. Gives the number of draws of that outcome.
-std::size_t Session::outcome_of_failing_load(Subject& s, const fuzzmodel::Instance& before, const Event& e,
+std::size_t Session::outcome_of_failing_load(Subject& s, const sorvel::test::model::Instance& before, const Event& e,
                                              std::size_t full_draws) {
     const std::size_t made = draws::made();
     // Tree and index both: two outcomes can differ in the order of
     // additions alone, which leaves the same tree when the lines do not
     // meet on their way down. The index is read once, when a tree matches.
     std::optional<std::vector<std::string>> index;
-    const auto matches = [&](const fuzzmodel::Instance& m, std::size_t used) {
+    const auto matches = [&](const sorvel::test::model::Instance& m, std::size_t used) {
         if (used != made || m.strings_size() != s.host->count(Set::strings) ||
             tree_difference(s.host->root(Set::strings), m.strings())) {
             return false;
@@ -365,8 +365,8 @@ std::size_t Session::outcome_of_failing_load(Subject& s, const fuzzmodel::Instan
     const std::optional<std::string> contents =
         e.file == Event::File::written ? std::optional(e.contents) : std::nullopt;
     for (std::size_t left_out = 0; left_out < e.lines; ++left_out) {
-        fuzzmodel::Instance candidate = before;
-        fuzzmodel::Draws d(e.draws);
+        sorvel::test::model::Instance candidate = before;
+        sorvel::test::model::Draws d(e.draws);
         candidate.load(contents, e.balance, d, left_out);
         if (matches(candidate, d.used())) {
             *s.model = std::move(candidate);
@@ -398,8 +398,8 @@ std::vector<std::string> Session::library_index(Subject& s) {
 void Session::expression(Subject& s, std::size_t number, std::optional<std::int32_t> integer_param,
                          std::optional<std::uint32_t> float_param_bits, const std::optional<Text>& text_param_value,
                          std::int32_t param_word, const std::vector<int>& script) {
-    const fuzzmodel::Instance& m = *s.model;
-    fuzzmodel::Draws model_draws(script);
+    const sorvel::test::model::Instance& m = *s.model;
+    sorvel::test::model::Draws model_draws(script);
     std::vector<Param>& params = params_;
     std::vector<ExpectedCall>& calls = calls_;
     params.clear();
@@ -493,7 +493,7 @@ void Session::expression(Subject& s, std::size_t number, std::optional<std::int3
 // collections are sampled with a stride (whose phase moves from sweep to
 // sweep), so a sweep costs a few hundred handler calls at most.
 void Session::sweep(Subject& s) {
-    const fuzzmodel::Instance& m = *s.model;
+    const sorvel::test::model::Instance& m = *s.model;
     ++sweeps_;
     const auto positions = [this](std::int32_t count, const auto& at) {
         const std::size_t n = static_cast<std::size_t>(count);

@@ -32,7 +32,7 @@ using sorvel::simulated::word;
 // One instance, in the library and in the model.
 struct Subject {
     sorvel::simulated::Instance* host = nullptr;
-    std::unique_ptr<fuzzmodel::Instance> model;
+    std::unique_ptr<sorvel::test::model::Instance> model;
     std::array<word, 3> indexes{};
     word reader = 0;
     int number = 0;
@@ -47,9 +47,9 @@ struct ExpectedCall {
 };
 
 // Walks the library's string tree and the model's side by side: the model's
-// node at which they first differ (fuzzmodel::kNone: at a missing one), or
+// node at which they first differ (sorvel::test::model::kNone: at a missing one), or
 // nothing when they agree.
-std::optional<int> tree_difference(word root, const fuzzmodel::Collection<std::string>& c);
+std::optional<int> tree_difference(word root, const sorvel::test::model::Collection<std::string>& c);
 
 class Session {
 public:
@@ -62,7 +62,7 @@ private:
     void run_event(const Event& e);
     void condition(Subject& s, const Event& e);
     void action(Subject& s, const Event& e);
-    std::size_t outcome_of_failing_load(Subject& s, const fuzzmodel::Instance& before, const Event& e,
+    std::size_t outcome_of_failing_load(Subject& s, const sorvel::test::model::Instance& before, const Event& e,
                                         std::size_t full_draws);
     std::vector<std::string> library_index(Subject& s);
     void expression(Subject& s, std::size_t number, std::optional<std::int32_t> integer_param,
@@ -85,7 +85,7 @@ private:
     Decoder decoder_;
     sorvel::simulated::Host host_;
     std::vector<Subject> subjects_;
-    std::vector<const fuzzmodel::Instance*> models_;  // the subjects', for the decoder
+    std::vector<const sorvel::test::model::Instance*> models_;  // the subjects', for the decoder
     std::size_t event_number_ = 0;
     std::size_t handler_calls_ = 0;
     const sorvel::simulated::Library::Allocations* allocations_;  // null: no failure can be injected

@@ -16,7 +16,7 @@
 
 namespace fuzzdriver {
 
-using Text = fuzzmodel::Instance::Text;
+using Text = sorvel::test::model::Instance::Text;
 
 // Reads the fuzzer's bytes from the front; past the end it gives zeros.
 class Input {

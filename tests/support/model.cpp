@@ -4,7 +4,7 @@
 #include <cstdlib>
 #include <utility>
 
-namespace fuzzmodel {
+namespace sorvel::test::model {
 namespace {
 
 [[noreturn]] void model_bug(const char* what) {
@@ -433,4 +433,4 @@ std::vector<std::string> split_lines(const std::string& bytes) {
     return lines;
 }
 
-}  // namespace fuzzmodel
+}  // namespace sorvel::test::model

@@ -15,7 +15,7 @@
 
 #include "simulated_host.hpp"
 
-namespace fuzzmodel {
+namespace sorvel::test::model {
 
 // Scripted draws of the runtime generator, in the order they are used.
 class Draws {
@@ -129,4 +129,4 @@ private:
 // a last line needs no terminator. Lines keep any zero bytes they hold.
 std::vector<std::string> split_lines(const std::string& bytes);
 
-}  // namespace fuzzmodel
+}  // namespace sorvel::test::model

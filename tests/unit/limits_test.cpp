@@ -121,14 +121,14 @@ TEST(BalancedLoad, BeyondTheReachOfOneDraw) {
     test::ScriptedDraws scripted{draws};
     load_lines(c, false, bytes.data(), file.size(), true, scripted.source());
 
-    fuzzmodel::Instance model(0, 0);
-    fuzzmodel::Draws model_draws(draws);
+    sorvel::test::model::Instance model(0, 0);
+    sorvel::test::model::Draws model_draws(draws);
     model.load(file, 1, model_draws);
     const auto& m = model.strings();
     EXPECT_EQ(scripted.used, model_draws.used());
     EXPECT_EQ(h.count, m.count);
     EXPECT_EQ(test::shape<char*>(h.root), test::preorder(
-                                              m.root, fuzzmodel::kNone,
+                                              m.root, sorvel::test::model::kNone,
                                               [&m](int n) {
                                                   return std::pair{m.at(n).left, m.at(n).right};
                                               },
