@@ -1,5 +1,5 @@
 // The library as a host sees it, where the differential fuzzer does not
-// look: exports by name and ordinal, the catalogue and information block,
+// look: the catalogue and information block,
 // the parameter word, result flags and space, allocation failure at
 // creation, and real files through the system.
 #include <gtest/gtest.h>
@@ -12,14 +12,13 @@
 #include <string>
 #include <vector>
 
-#include "e2e_fixture.hpp"
-#include "exports_table.hpp"
+#include "host/abi.hpp"
 #include "host/catalogue.hpp"
+#include "simulated_host.hpp"
 #include "support.hpp"
 
 namespace {
 
-using sorvel::e2e::HostTest;
 using sorvel::simulated::Host;
 using sorvel::simulated::HostCall;
 using sorvel::simulated::Instance;
@@ -32,28 +31,25 @@ using Routine = HostCall::Routine;
 namespace catalogue = sorvel::catalogue;
 namespace answers = sorvel::answers;
 
+// One host over the built library, and what every test must leave.
+class HostTest : public ::testing::Test {
+protected:
+    void TearDown() override {
+        // On i386 every call into the library is checked for the stdcall
+        // contract: the callee must have removed exactly its arguments.
+        EXPECT_EQ(Library::stack_errors(), 0U) << "a callee removed the wrong number of argument bytes";
+        EXPECT_EQ(host.open_handles(), 0U) << "every opened file is closed";
+        EXPECT_EQ(host.bad_closes(), 0U) << "only opened handles are closed";
+    }
+
+    Host host{Library::built()};
+};
+
 template <class T>
 T at(const unsigned char* bytes, std::size_t offset) {
     T v;
     std::memcpy(&v, bytes + offset, sizeof v);
     return v;
-}
-
-// The fuzzer calls every export by name for its answer; a host may also
-// find each by its ordinal.
-TEST_F(HostTest, ExportsByNameAndOrdinal) {
-    Library& library = host.library();
-    for (const sorvel::test::ExportEntry& e : sorvel::test::kExports) {
-        void* function = library.symbol(e.name);
-        ASSERT_NE(function, nullptr) << e.name;
-        if (library.loader_owned()) {  // a Windows export table
-            EXPECT_EQ(library.symbol_by_ordinal(e.ordinal), function) << e.name << " @" << e.ordinal;
-        }
-    }
-    EXPECT_EQ(library.symbol("NoSuchExport"), nullptr);
-    for (int unused : {1, 3, 113}) {
-        EXPECT_EQ(library.symbol_by_ordinal(unused), nullptr) << unused;
-    }
 }
 
 TEST_F(HostTest, InformationBlockAndHandlerTables) {
