@@ -219,19 +219,6 @@ void* Library::symbol(const char* name) const {
 #endif
 }
 
-void* Library::symbol_by_ordinal(int ordinal) const {
-#if defined(_WIN32)
-    if (handle_ == nullptr || ordinal <= 0 || ordinal > 0xFFFF) {
-        return nullptr;
-    }
-    return reinterpret_cast<void*>(
-        GetProcAddress(reinterpret_cast<HMODULE>(handle_), MAKEINTRESOURCEA(static_cast<WORD>(ordinal))));
-#else
-    (void)ordinal;
-    return nullptr;
-#endif
-}
-
 word Library::module_handle() const {
     return reinterpret_cast<word>(handle_);
 }

@@ -98,7 +98,6 @@ public:
     Library& operator=(const Library&) = delete;
 
     void* symbol(const char* name) const;        // null when absent
-    void* symbol_by_ordinal(int ordinal) const;  // Windows DLLs only; null elsewhere
     word module_handle() const;
     // Seeds the C runtime generator that the library shares with this program.
     void seed_rand(unsigned seed) const;
