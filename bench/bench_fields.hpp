@@ -5,6 +5,8 @@
 
 #include <cstdint>
 #include <random>
+#include <string>
+#include <string_view>
 #include <vector>
 
 #if defined(__GLIBC__)
@@ -22,6 +24,27 @@ inline std::vector<std::int32_t> random_ints(std::size_t n, std::uint32_t seed =
     std::vector<std::int32_t> v(n);
     for (auto& x : v) {
         x = static_cast<std::int32_t>(random());
+    }
+    return v;
+}
+
+// Alphabets of random strings.
+inline constexpr std::string_view kPrintable =
+    "!\"#$%&'()*+,-./0123456789:;<=>?@ABCDEFGHIJKLMNOPQRSTUVWXYZ[\\]^_`abcdefghijklmnopqrstuvwxyz{|}~";
+inline constexpr std::string_view kLetters = "abcdefghijklmnopqrstuvwxyz";
+// Letters of both cases, digits and "_[]": case folding matters for them.
+inline constexpr std::string_view kMixedCase = "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789_[]";
+
+// Random strings of 8 to 24 bytes of the alphabet (repeats possible), the
+// same for the same seed.
+inline std::vector<std::string> random_strings(std::size_t n, std::uint32_t seed, std::string_view alphabet) {
+    std::mt19937 random(seed);
+    std::vector<std::string> v(n);
+    for (auto& s : v) {
+        s.resize(8 + random() % 17);
+        for (char& c : s) {
+            c = alphabet[random() % alphabet.size()];
+        }
     }
     return v;
 }

@@ -23,30 +23,12 @@ using namespace sorvel;
 constexpr std::size_t kValues = 1'000'000;
 
 const std::vector<std::int32_t>& random_integers() {
-    static const std::vector<std::int32_t> values = [] {
-        std::mt19937 random(20240601);
-        std::vector<std::int32_t> v(kValues);
-        for (auto& x : v) {
-            x = static_cast<std::int32_t>(random());
-        }
-        return v;
-    }();
+    static const std::vector<std::int32_t> values = bench::random_ints(kValues, 20240601);
     return values;
 }
 
-// Printable strings of 8 to 24 bytes.
 const std::vector<std::string>& random_strings() {
-    static const std::vector<std::string> values = [] {
-        std::mt19937 random(20240602);
-        std::vector<std::string> v(kValues);
-        for (auto& s : v) {
-            s.resize(8 + random() % 17);
-            for (char& c : s) {
-                c = static_cast<char>('!' + random() % 94);
-            }
-        }
-        return v;
-    }();
+    static const std::vector<std::string> values = bench::random_strings(kValues, 20240602, bench::kPrintable);
     return values;
 }
 
@@ -156,12 +138,7 @@ std::vector<T> probes_for(const std::vector<T>& held, const std::vector<T>& abse
 
 const std::vector<std::int32_t>& integer_probes() {
     static const std::vector<std::int32_t> probes = [] {
-        std::mt19937 random(99);
-        std::vector<std::int32_t> absent(kValues);
-        for (auto& x : absent) {
-            x = static_cast<std::int32_t>(random());
-        }
-        return probes_for(random_integers(), absent);
+        return probes_for(random_integers(), bench::random_ints(kValues, 99));
     }();
     return probes;
 }

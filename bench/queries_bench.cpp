@@ -32,15 +32,8 @@ struct Data {
 const Data& data() {
     static const Data d = [] {
         Data out;
-        std::mt19937 random(31337);
-        for (std::size_t i = 0; i < kValues; ++i) {
-            out.integers.push_back(static_cast<std::int32_t>(random()));
-            std::string s(8 + random() % 17, ' ');
-            for (char& c : s) {
-                c = static_cast<char>('a' + random() % 26);
-            }
-            out.strings.push_back(s);
-        }
+        out.integers = bench::random_ints(kValues, 31337);
+        out.strings = bench::random_strings(kValues, 31338, bench::kLetters);
         out.integer_probes = out.integers;
         out.string_probes = out.strings;
         std::shuffle(out.integer_probes.begin(), out.integer_probes.end(), std::mt19937(1));

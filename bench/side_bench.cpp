@@ -20,18 +20,8 @@ using namespace sorvel;
 using bench::random_ints;
 using test::Holder;
 
-// Letters of both cases, digits and "_[]": case folding matters for them.
 std::vector<std::string> random_strings(std::size_t n) {
-    static const char kBytes[] = "abcdefghijklmnopqrstuvwxyzABCDEFGHIJKLMNOPQRSTUVWXYZ0123456789_[]";
-    std::mt19937 random(12);
-    std::vector<std::string> v(n);
-    for (auto& s : v) {
-        s.resize(8 + random() % 17);
-        for (char& c : s) {
-            c = kBytes[random() % (sizeof(kBytes) - 1)];
-        }
-    }
-    return v;
+    return bench::random_strings(n, 12, bench::kMixedCase);
 }
 
 bool put(Collection<std::int32_t>& c, std::int32_t v, bool) {
