@@ -2,6 +2,7 @@
 
 #include <unistd.h>
 
+#include <algorithm>
 #include <bit>
 #include <cstdio>
 #include <cstdlib>
@@ -12,6 +13,7 @@
 #include "draws.hpp"
 #include "driver.hpp"
 #include "host/catalogue.hpp"
+#include "invariants.hpp"
 
 namespace fuzzdriver {
 namespace {
@@ -364,7 +366,19 @@ std::size_t Session::outcome_of_failing_load(Subject& s, const sorvel::test::mod
     }
     const std::optional<std::string> contents =
         e.file == Event::File::written ? std::optional(e.contents) : std::nullopt;
-    for (std::size_t left_out = 0; left_out < e.lines; ++left_out) {
+    // The line left out is about the failing allocation's number less the
+    // buffers made before the first line: try there first, then outwards.
+    const std::size_t guess = std::min(e.lines - 1, static_cast<std::size_t>(e.failing > 2 ? e.failing - 2 : 0));
+    std::vector<std::size_t> order;
+    for (std::size_t away = 0; order.size() < e.lines; ++away) {
+        if (guess + away < e.lines) {
+            order.push_back(guess + away);
+        }
+        if (away != 0 && away <= guess) {
+            order.push_back(guess - away);
+        }
+    }
+    for (const std::size_t left_out : order) {
         sorvel::test::model::Instance candidate = before;
         sorvel::test::model::Draws d(e.draws);
         candidate.load(contents, e.balance, d, left_out);
@@ -379,9 +393,13 @@ std::size_t Session::outcome_of_failing_load(Subject& s, const sorvel::test::mod
         std::to_string(made) + " times, holds " + std::to_string(s.host->count(Set::strings)) + " strings)");
 }
 
-// The string index read back through StringElementAt$; the result flags
-// are put back as they were.
+// The string index read back: from its slots where the library is this
+// program's own, else through StringElementAt$, with the result flags put
+// back as they were.
 std::vector<std::string> Session::library_index(Subject& s) {
+    if (inspect_) {
+        return sorvel::test::indexed_strings(*reinterpret_cast<const sorvel::RunRecord*>(s.host->record()));
+    }
     std::vector<std::string> out;
     const std::uint16_t flags = s.host->result_flags();
     for (std::int32_t p = 0; s.indexes[static_cast<std::size_t>(Set::strings)] != 0 && p < s.host->count(Set::strings);

@@ -142,6 +142,18 @@ std::string check_collection(Node* const* root, std::int32_t count, const SideSt
     return {};
 }
 
+// The strings of an instance of the library linked in, in the index's order,
+// read from the slots rather than through the host.
+inline std::vector<std::string> indexed_strings(const RunRecord& r) {
+    std::vector<std::string> out;
+    for (std::uint32_t s = 0; r.string_index != nullptr && s < r.string_index->used(); ++s) {
+        if (const auto* node = r.string_index->slot(s)) {
+            out.emplace_back(node->value);
+        }
+    }
+    return out;
+}
+
 // One collection of an instance of the library linked in (the layouts are
 // this program's own).
 inline std::string check_collection(const RunRecord& r, simulated::Set set) {
