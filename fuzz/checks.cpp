@@ -81,13 +81,13 @@ void Session::call_exports() {
         if (std::string_view(e.name) == "GetInfos") {
             w[0] = code;
             want = 0;
-            for (const auto& a : sorvel::test::kInfoAnswers) {
+            for (const auto& a : sorvel::test::expected::kInfos) {
                 want = a.code == code ? a.answer : want;
             }
         } else if (std::string_view(e.name) == "GetRunObjectDataSize") {
             want = static_cast<word>(RecordLayout::kRunRecordSize);
         } else if (std::string_view(e.name) == "HandleRunObject") {
-            want = sorvel::answers::kHandleRunObject;
+            want = sorvel::test::expected::kHandleRunObject;
         } else if (!e.stub) {
             continue;  // the rest take the host's records: the session calls them
         }

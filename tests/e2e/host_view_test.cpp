@@ -12,7 +12,7 @@
 #include <string>
 #include <vector>
 
-#include "host/abi.hpp"
+#include "exports_table.hpp"
 #include "host/catalogue.hpp"
 #include "simulated_host.hpp"
 #include "support.hpp"
@@ -29,7 +29,7 @@ using sorvel::simulated::Set;
 using sorvel::simulated::word;
 using Routine = HostCall::Routine;
 namespace catalogue = sorvel::catalogue;
-namespace answers = sorvel::answers;
+namespace expected = sorvel::test::expected;
 
 // One host over the built library, and what every test must leave.
 class HostTest : public ::testing::Test {
@@ -60,12 +60,12 @@ TEST_F(HostTest, InformationBlockAndHandlerTables) {
         EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoCounts + 2), 10);
         EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoCounts + 4), 12);
         EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoCounts + 6), 28) << "EditRecord size";
-        EXPECT_EQ(at<std::uint32_t>(b, RecordLayout::kInfoFlags), answers::kInfoFlags);
-        EXPECT_EQ(b[RecordLayout::kInfoLetter], answers::kInfoLetter);
+        EXPECT_EQ(at<std::uint32_t>(b, RecordLayout::kInfoFlags), expected::kInfoFlags);
+        EXPECT_EQ(b[RecordLayout::kInfoLetter], expected::kInfoLetter);
         EXPECT_EQ(b[RecordLayout::kInfoUntouched], fill) << "byte 25 is the host's";
         EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoZero), 0);
         EXPECT_EQ(std::string(reinterpret_cast<const char*>(b) + RecordLayout::kInfoIdentifier, 4), "LVRS");
-        EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoVersion), answers::kVersion);
+        EXPECT_EQ(at<std::uint16_t>(b, RecordLayout::kInfoVersion), expected::kVersion);
         EXPECT_EQ(b[RecordLayout::kInfoSize], fill) << "nothing written beyond the block";
     }
     // Every handler once, each table ending in a null; later loader calls

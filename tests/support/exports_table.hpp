@@ -6,8 +6,6 @@
 #include <array>
 #include <cstdint>
 
-#include "host/abi.hpp"
-
 namespace sorvel::test {
 
 struct ExportEntry {
@@ -102,7 +100,20 @@ inline constexpr std::array<ExportEntry, 74> kExports{{
     stub("GetDependencies", 44, 0),
 }};
 
+// The fixed answers a host expects, written out here rather than taken from
+// the library's own constants (host/abi.hpp), so that a wrong constant shows.
+namespace expected {
+struct InfoAnswer {
+    std::int32_t code;
+    std::int32_t answer;
+};
 // GetInfos: the codes with an answer; every other code gives 0.
-inline constexpr const auto& kInfoAnswers = answers::kInfos;
+inline constexpr std::array<InfoAnswer, 4> kInfos{{{0, 768}, {2, 256}, {6, 2}, {7, 247}}};
+inline constexpr std::int32_t kHandleRunObject = 2;
+// The ObjectInfoBlock's constant fields.
+inline constexpr std::uint32_t kInfoFlags = 2305;
+inline constexpr char kInfoLetter = 'd';
+inline constexpr std::uint16_t kVersion = 1;
+}  // namespace expected
 
 }  // namespace sorvel::test
